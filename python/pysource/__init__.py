@@ -1,0 +1,1 @@
+"""Source analysis for the editor: logical lines, symbol info and the scope body cache."""

@@ -1,0 +1,1 @@
+"""Support classes shared by the editor's components."""

@@ -1,0 +1,173 @@
+// Reference ownership and the single error channel shared by every native
+// module of the project.
+#pragma once
+
+#include <Python.h>
+
+#include <new>
+#include <utility>
+
+// Init functions must stay visible although the modules build with hidden
+// visibility (the 2.7 headers' PyMODINIT_FUNC does not say so).
+#define PY_MODULE_INIT extern "C" __attribute__((visibility("default"))) void
+
+namespace py {
+
+// Thrown when a C API call failed and a Python exception is already set.
+// Caught at every entry point from the interpreter; never crosses into it.
+struct Error {};
+
+[[noreturn]] inline void fail() { throw Error{}; }
+
+// A borrowed view: never touches the reference count.
+class Borrowed {
+public:
+    constexpr Borrowed() noexcept = default;
+    constexpr explicit Borrowed(PyObject* o) noexcept : obj_(o) {}
+    PyObject* get() const noexcept { return obj_; }
+    explicit operator bool() const noexcept { return obj_ != nullptr; }
+    bool isNone() const noexcept { return obj_ == Py_None; }
+
+private:
+    PyObject* obj_ = nullptr;
+};
+
+// An owning handle. It never converts to PyObject* implicitly: get() lends,
+// release() hands the reference back to the interpreter.
+class Ref {
+public:
+    Ref() noexcept = default;
+    Ref(const Ref&) = delete;
+    Ref& operator=(const Ref&) = delete;
+    Ref(Ref&& other) noexcept : obj_(other.obj_) { other.obj_ = nullptr; }
+    Ref& operator=(Ref&& other) noexcept {
+        if (this != &other) {
+            PyObject* old = obj_;
+            obj_ = other.obj_;
+            other.obj_ = nullptr;
+            Py_XDECREF(old);
+        }
+        return *this;
+    }
+    ~Ref() { Py_XDECREF(obj_); }
+
+    // Takes over a new reference (may be null).
+    static Ref steal(PyObject* o) noexcept { return Ref(o); }
+    // Takes a new reference to a borrowed object (may be null).
+    static Ref own(PyObject* o) noexcept {
+        Py_XINCREF(o);
+        return Ref(o);
+    }
+    static Ref own(Borrowed b) noexcept { return own(b.get()); }
+    static Ref none() noexcept { return own(Py_None); }
+
+    PyObject* get() const noexcept { return obj_; }
+    Borrowed borrow() const noexcept { return Borrowed(obj_); }
+    PyObject* release() noexcept {
+        PyObject* o = obj_;
+        obj_ = nullptr;
+        return o;
+    }
+    Ref copy() const noexcept { return own(obj_); }
+    void reset() noexcept {
+        PyObject* old = obj_;
+        obj_ = nullptr;
+        Py_XDECREF(old);
+    }
+    explicit operator bool() const noexcept { return obj_ != nullptr; }
+    bool isNone() const noexcept { return obj_ == Py_None; }
+
+private:
+    explicit Ref(PyObject* o) noexcept : obj_(o) {}
+    PyObject* obj_ = nullptr;
+};
+
+// A new reference that must not be null; throws when the call failed.
+inline Ref check(PyObject* newRef) {
+    if (newRef == nullptr) fail();
+    return Ref::steal(newRef);
+}
+
+// An int status of the C API (-1 with an exception set means failure).
+inline int checkStatus(int status) {
+    if (status == -1 && PyErr_Occurred()) fail();
+    return status;
+}
+
+inline Py_ssize_t checkSize(Py_ssize_t n) {
+    if (n == -1 && PyErr_Occurred()) fail();
+    return n;
+}
+
+inline bool truth(PyObject* o) { return checkStatus(PyObject_IsTrue(o)) != 0; }
+
+// A machine-size index; non-integers raise the interpreter's TypeError
+// instead of being truncated.
+inline Py_ssize_t asIndex(PyObject* o) {
+    if (PyInt_CheckExact(o)) return PyInt_AS_LONG(o);
+    PyObject* index = PyNumber_Index(o);
+    if (index == nullptr) fail();
+    Py_ssize_t v = PyInt_AsSsize_t(index);
+    Py_DECREF(index);
+    if (v == -1 && PyErr_Occurred()) fail();
+    return v;
+}
+
+// Stores `value` into an owned PyObject* slot. The old value is released
+// last: its destructor may run Python code that looks at the slot.
+inline void storeSlot(PyObject** slot, PyObject* value) noexcept {
+    PyObject* old = *slot;
+    Py_XINCREF(value);
+    *slot = value;
+    Py_XDECREF(old);
+}
+
+// Runs `body` and turns the C++ error channel into the interpreter's.
+template <class Body>
+PyObject* guarded(Body&& body) noexcept {
+    try {
+        return body();
+    } catch (const Error&) {
+        return nullptr;
+    } catch (const std::bad_alloc&) {
+        PyErr_NoMemory();
+        return nullptr;
+    }
+}
+
+template <class Body>
+int guardedStatus(Body&& body) noexcept {
+    try {
+        return body();
+    } catch (const Error&) {
+        return -1;
+    } catch (const std::bad_alloc&) {
+        PyErr_NoMemory();
+        return -1;
+    }
+}
+
+// Keeps the pending exception aside while cleanup code runs; restores it
+// unless the cleanup raised one of its own.
+class SavedError {
+public:
+    SavedError() noexcept { PyErr_Fetch(&type_, &value_, &tb_); }
+    SavedError(const SavedError&) = delete;
+    SavedError& operator=(const SavedError&) = delete;
+    void restore() noexcept {
+        PyErr_Restore(type_, value_, tb_);
+        type_ = value_ = tb_ = nullptr;
+    }
+    ~SavedError() {
+        Py_XDECREF(type_);
+        Py_XDECREF(value_);
+        Py_XDECREF(tb_);
+    }
+
+private:
+    PyObject* type_ = nullptr;
+    PyObject* value_ = nullptr;
+    PyObject* tb_ = nullptr;
+};
+
+}  // namespace py

@@ -1,0 +1,90 @@
+// Inline accessors of logicals and the byte-wise name comparison. They
+// belong to the siblings' shared declarations; this module carries its own
+// implementation of each.
+#pragma once
+
+#include "common/pyref.hpp"
+#include "pysource/contracts/logical_record.hpp"
+
+#include <cstring>
+
+namespace contracts {
+
+// The record type, bound at import from pysource._fastaccess.
+extern PyTypeObject* gLogicalLineType;
+
+using Logical = LogicalLineObject;
+
+inline bool logicalCheck(PyObject* o) noexcept { return Py_TYPE(o) == gLogicalLineType; }
+
+inline Logical* asLogical(PyObject* o) noexcept { return reinterpret_cast<Logical*>(o); }
+
+// TypeError "Argument must be a logical" unless `o` is exactly a logical.
+Logical* requireLogical(PyObject* o);
+
+inline bool isWhitespace(const Logical* l) noexcept {
+    return l->fKind == kCommentLogical || l->fKind == kBlankLogical;
+}
+
+inline bool isScopeStart(const Logical* l) noexcept {
+    return l->fKind == kDefLogical || l->fKind == kClassLogical;
+}
+
+// fScopeName, None when absent. Borrowed.
+inline PyObject* scopeName(const Logical* l) noexcept {
+    return l->fScopeName ? l->fScopeName : Py_None;
+}
+
+inline void setScopeName(Logical* l, PyObject* name) noexcept { py::storeSlot(&l->fScopeName, name); }
+
+// The defined name: fLocalScopeName when set, else the name token of a
+// class/def line; nullptr when there is none. Borrowed.
+inline PyObject* localScopeDefined(const Logical* l) noexcept {
+    if (l->fLocalScopeName != nullptr && l->fLocalScopeName != Py_None) return l->fLocalScopeName;
+    const bool isDef = l->fKind == kDefLogical;
+    if (!isDef && l->fKind != kClassLogical) return nullptr;
+    const char* keyword = isDef ? "def" : "class";
+    for (Py_ssize_t i = 0; i < l->fTokenCount; ++i) {
+        PyObject* token = l->fTokens[i];
+        if (PyString_Check(token)) {
+            const char* text = PyString_AS_STRING(token);
+            if (text[0] == '\\' || std::strcmp(text, keyword) == 0) continue;
+            if (isDef && std::strcmp(text, "async") == 0) continue;
+        }
+        return token;
+    }
+    return nullptr;
+}
+
+// As localScopeDefined, with the exact-str test of the Python entry point.
+PyObject* localScopeDefinedChecked(const Logical* l);
+
+// None clears the field.
+inline void setLocalScopeDefined(Logical* l, PyObject* name) noexcept {
+    py::storeSlot(&l->fLocalScopeName, name == Py_None ? nullptr : name);
+}
+
+// The bytes of a name: a str directly, a unicode through the default
+// encoding, a bytearray's buffer; anything else is a TypeError.
+class NameBytes {
+public:
+    explicit NameBytes(PyObject* name);
+    const char* get() const noexcept { return bytes_; }
+
+private:
+    py::Ref encoded_;
+    const char* bytes_ = nullptr;
+};
+
+// Whether two names have the same bytes up to the first NUL.
+inline bool strEquals(PyObject* a, PyObject* b) {
+    if (a == b && PyString_CheckExact(a)) return true;
+    if (PyString_CheckExact(a) && PyString_CheckExact(b)) {
+        return std::strcmp(PyString_AS_STRING(a), PyString_AS_STRING(b)) == 0;
+    }
+    NameBytes c(b);
+    NameBytes s(a);
+    return std::strcmp(s.get(), c.get()) == 0;
+}
+
+}  // namespace contracts

@@ -1,0 +1,66 @@
+// How the sibling modules publish typed entry points: a dict attribute
+// `_capi` on the module, mapping each entry name to a PyCapsule whose
+// capsule name is the entry's signature text. A variable's capsule points
+// at the variable; a function's capsule is the function pointer.
+#pragma once
+
+#include <Python.h>
+
+namespace contracts {
+
+inline constexpr const char* kCapiAttr = "_capi";
+
+namespace sig {
+inline constexpr const char* kObject = "PyObject *";
+inline constexpr const char* kChar = "char";
+inline constexpr const char* kSsize = "Py_ssize_t";
+inline constexpr const char* kInt = "int";
+inline constexpr const char* kJoinTwo = "PyObject *(PyObject *, PyObject *, int)";
+inline constexpr const char* kSplitOne = "PyObject *(PyObject *, int)";
+inline constexpr const char* kAppendSuffixes =
+    "PyObject *(PyObject *, PyObject *, PyObject *, int)";
+}  // namespace sig
+
+// Function entry points of pysource.symbolinfo. The trailing flag tells the
+// function to skip looking for a Python-level override; callers pass 0.
+using JoinTwoScopeNamesFn = PyObject* (*)(PyObject* scope, PyObject* name, int skip);
+using SplitScopeNamesFn = PyObject* (*)(PyObject* full, int skip);
+using SplitScopeNameFromSuffixesFn = PyObject* (*)(PyObject* name, int skip);
+using AppendScopeSuffixesFn = PyObject* (*)(PyObject* name, PyObject* index, PyObject* extra,
+                                            int skip);
+
+// The 61 typed variables of pysource.symbolinfo, in publishing order.
+// Each stem X gives kXPrefix (object) and kXKind (char).
+#define SYMBOLINFO_PREFIX_KIND_STEMS(X) \
+    X(Set)                              \
+    X(Get)                              \
+    X(SetTypeHint)                      \
+    X(Nonlocal)                         \
+    X(Global)                           \
+    X(WithinExpr)                       \
+    X(Import)                           \
+    X(FromImport)                       \
+    X(Decorator)
+
+#define SYMBOLINFO_PREFIX_KIND_STEMS2(X) \
+    X(SpecificScope)                     \
+    X(SpecificUrl)                       \
+    X(BuiltinModule)                     \
+    X(TypingModule)                      \
+    X(BuiltinClass)                      \
+    X(TypedLiteral)                      \
+    X(Arg)                               \
+    X(TypeHint)
+
+#define SYMBOLINFO_PREFIX_KIND_STEMS3(X) \
+    X(Method)                            \
+    X(UnboundMethod)                     \
+    X(Function)                          \
+    X(Class)                             \
+    X(Self)                              \
+    X(Instance)                          \
+    X(Module)                            \
+    X(InferredTypeHint)                  \
+    X(Called)
+
+}  // namespace contracts

@@ -1,0 +1,50 @@
+// Removed logicals and the recording of changes into the three change sets.
+#include "pysource/scopebodycache/finder.hpp"
+#include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/siblings.hpp"
+
+namespace sbc::finder {
+
+using namespace contracts;
+
+py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList) {
+    if (removedList == Py_None) raise(PyExc_TypeError, msg::kNoneNotIterable);
+    py::Ref result = py::check(PyList_New(0));
+    Py_ssize_t lastIndex = -1;
+    for (Py_ssize_t k = 0; k < PyList_GET_SIZE(removedList); ++k) {
+        py::Ref item = py::Ref::own(PyList_GET_ITEM(removedList, k));
+        Logical* logical = requireLogical(item.get());
+        py::Ref scope = py::Ref::own(scopeName(logical));
+        if (scope.isNone()) continue;
+        route::LogicalInScopeChanged(self, item.get(), scope.get());
+        const Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno);
+        if (index != lastIndex && index >= 0 && index < logicalListLength(self)) {
+            py::Ref value = py::check(PyInt_FromSsize_t(index));
+            py::checkStatus(PyList_Append(result.get(), value.get()));
+        }
+        lastIndex = index;
+    }
+    return result;
+}
+
+void LogicalInScopeChanged(PyObject* self, PyObject* logicalObj, PyObject* scopeName,
+                           PyObject* oldContainingScope, PyObject* oldLeafScope) {
+    FinderState& s = finderState(self);
+    addChange(s.contentsChanges, scopeName);
+    if (oldContainingScope != Py_None) addChange(s.contentsChanges, oldContainingScope);
+    Logical* logical = requireLogical(logicalObj);
+    if (!isScopeStart(logical)) return;
+    py::Ref keep = py::Ref::own(logicalObj);
+    const bool isClass = logical->fKind == kClassLogical;
+    py::Ref defined = py::Ref::own(localScopeDefinedChecked(logical));
+    if (defined) {
+        py::Ref full = joinTwoScopeNames(scopeName, defined.get());
+        addChange(isClass ? s.classChanges : s.functionChanges, full.get());
+    }
+    if (oldContainingScope != Py_None && oldLeafScope != Py_None) {
+        py::Ref full = joinTwoScopeNames(oldContainingScope, oldLeafScope);
+        addChange(isClass ? s.classChanges : s.functionChanges, full.get());
+    }
+}
+
+}  // namespace sbc::finder

@@ -1,0 +1,177 @@
+// The incremental pass: visit, in ascending order, only the indices that may
+// have changed, and carry changes forward until they stop.
+#include "pysource/scopebodycache/finder.hpp"
+#include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/siblings.hpp"
+
+namespace sbc::finder {
+
+using namespace contracts;
+
+namespace {
+
+bool nonEmptySet(PyObject* set) { return PyAnySet_Check(set) && PySet_GET_SIZE(set) > 0; }
+
+// Once a definition was added, removed or renamed, the indices of later
+// same-named definitions may be stale; repair them before anything at
+// `index` is named from the logicals above it. Without such a change the
+// table is left alone, so ordinary typing never walks the list.
+void bringScopesSeenUpTo(PyObject* self, Py_ssize_t index) {
+    FinderState& s = finderState(self);
+    if (index > s.endIndexForScopesSeen &&
+        (nonEmptySet(s.classChanges) || nonEmptySet(s.functionChanges))) {
+        UpdateScopesSeen(self, index);
+    }
+}
+
+// The first index of the run of comment/blank lines just before `i` that
+// this pass has not processed yet (i itself when there is none).
+Py_ssize_t startOfUnprocessedWhitespace(PyObject* self, Py_ssize_t i) {
+    const FinderState& s = finderState(self);
+    Py_ssize_t b = i;
+    while (b - 1 > s.lastProcessedIndex && b - 1 >= 0) {
+        py::Ref prior = logicalAt(self, b - 1);
+        if (!isWhitespace(requireLogical(prior.get()))) break;
+        --b;
+    }
+    return b;
+}
+
+PyObject* requireIndexList(PyObject* indices, const char* method) {
+    if (indices == Py_None) raiseNoneAttribute(method);
+    return indices;
+}
+
+}  // namespace
+
+void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices) {
+    FinderState& s = finderState(self);
+    s.lastProcessedIndex = -1;
+    if (addedList == Py_None) raise(PyExc_TypeError, msg::kNoneNotIterable);
+    for (Py_ssize_t k = 0; k < PyList_GET_SIZE(addedList); ++k) {
+        py::Ref item = py::Ref::own(PyList_GET_ITEM(addedList, k));
+        requireLogical(item.get());
+        const Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get());
+        if (assertionsOn()) {
+            py::Ref at = logicalAt(self, i);
+            assertThat(at.get() == item.get());
+        }
+        py::Ref value = py::check(PyInt_FromSsize_t(i));
+        py::checkStatus(PyList_Append(requireIndexList(indices, "append"), value.get()));
+    }
+    py::checkStatus(PyList_Sort(requireIndexList(indices, "sort")));
+
+    Py_ssize_t resume = -1;
+    Py_ssize_t position = 0;
+    while (position < PyList_GET_SIZE(indices)) {
+        const Py_ssize_t i = py::asIndex(PyList_GET_ITEM(indices, position));
+        ++position;
+        py::Ref item = logicalAt(self, i);
+        Logical* logical = requireLogical(item.get());
+        if (resume != -1) {
+            if (i < resume) continue;
+            resume = -1;
+        }
+        s.nextChangeIndex = position < PyList_GET_SIZE(indices)
+                                ? py::asIndex(PyList_GET_ITEM(indices, position))
+                                : logicalListLength(self);
+        if (s.nextChangeIndex == i) continue;
+
+        // Comment and blank lines take their scope from the code line after
+        // them, so the whole unprocessed run around i is placed together.
+        const Py_ssize_t first = startOfUnprocessedWhitespace(self, i);
+        if (isWhitespace(logical) || first < i) {
+            bringScopesSeenUpTo(self, first);
+            const Py_ssize_t r = route::ProcessDedentedComments(self, first);
+            if (isWhitespace(logical)) {
+                assertThat(r > i);
+                s.lastProcessedIndex = r - 1;
+                resume = r;
+                // A run that reaches the end of the list leaves nothing to visit.
+                if (r < logicalListLength(self)) {
+                    Py_ssize_t at = position;
+                    while (at < PyList_GET_SIZE(indices) &&
+                           py::asIndex(PyList_GET_ITEM(indices, at)) < r) {
+                        ++at;
+                    }
+                    if (at == PyList_GET_SIZE(indices) ||
+                        py::asIndex(PyList_GET_ITEM(indices, at)) != r) {
+                        py::Ref value = py::check(PyInt_FromSsize_t(r));
+                        py::checkStatus(PyList_Insert(indices, at, value.get()));
+                    }
+                }
+                continue;
+            }
+            s.lastProcessedIndex = i - 1;
+        }
+        bringScopesSeenUpTo(self, i);
+        ProcessNonDedentedComment(self, item.get(), i);
+        s.lastProcessedIndex = i;
+    }
+}
+
+void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t i) {
+    py::Ref scope = route::FindScopeNameContainingLogical(self, i);
+    assertThat(!scope.isNone());
+    requireStrOrNone(scope.get());
+    Logical* logical = requireLogical(logicalObj);
+    py::Ref previous = py::Ref::own(scopeName(logical));
+    bool changed = false;
+    if (previous.isNone() || !strEquals(previous.get(), scope.get())) {
+        setScopeName(logical, scope.get());
+        changed = true;
+    }
+    py::Ref previousLocal = py::Ref::none();
+    if (isScopeStart(logical) && localScopeDefined(logical) != nullptr) {
+        const Py_ssize_t index = route::FindScopeIndexForLogical(self, logicalObj, i);
+        py::Ref newLocal = route::GetLeafScopeWithIndex(self, logicalObj, index);
+        previousLocal = py::Ref::own(localScopeDefined(logical));
+        assertThat(bool(previousLocal));
+        if (!previousLocal) previousLocal = py::Ref::none();
+        if (previousLocal.isNone() || !strEquals(newLocal.get(), previousLocal.get())) {
+            setLocalScopeDefined(logical, newLocal.get());
+            changed = true;
+        }
+    }
+    if (!changed) return;
+    if (!previousLocal.isNone() && !leafScopeNameHasIndex(previousLocal.get())) {
+        previousLocal = py::Ref::none();
+    }
+    route::LogicalInScopeChanged(self, logicalObj, scope.get(), previous.get(), previousLocal.get());
+    ScanForwardForChangedScopes(self, i + 1);
+}
+
+void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start) {
+    FinderState& s = finderState(self);
+    assertThat(s.nextChangeIndex != -1);
+    Py_ssize_t k = start;
+    while (k < s.nextChangeIndex) {
+        py::Ref item = logicalAt(self, k);
+        Logical* logical = requireLogical(item.get());
+        py::Ref previous = py::Ref::own(scopeName(logical));
+        if (previous.isNone()) return;
+        if (isWhitespace(logical)) {
+            // Placed with the rest of its run; an unchanged comment says
+            // nothing about the code after it, so the scan goes on.
+            const Py_ssize_t r = route::ProcessDedentedComments(self, k);
+            if (r <= k) return;
+            k = r;
+            continue;
+        }
+        py::Ref scope = route::FindScopeNameContainingLogical(self, k);
+        if (scope.isNone()) {
+            assertThat(false);
+            return;
+        }
+        if (py::checkStatus(PyObject_RichCompareBool(scope.get(), previous.get(), Py_EQ))) return;
+        if (!PyString_CheckExact(scope.get())) raiseExpectedType("str", scope.get());
+        // Recorded before the update, while a class/def still carries its
+        // old local name, so that its old full name is in the change sets.
+        route::LogicalInScopeChanged(self, item.get(), previous.get());
+        route::UpdateLogicalScopeName(self, item.get(), k, scope.get());
+        route::LogicalInScopeChanged(self, item.get(), scope.get());
+        ++k;
+    }
+}
+
+}  // namespace sbc::finder

@@ -1,0 +1,65 @@
+// The whole-list pass: one forward walk with a stack of open scopes, taken
+// when a file was just read or its contents were replaced.
+#include "pysource/scopebodycache/finder.hpp"
+#include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/siblings.hpp"
+
+#include <vector>
+
+namespace sbc::finder {
+
+using namespace contracts;
+
+namespace {
+struct OpenScope {
+    py::Ref name;
+    int indent;
+};
+}  // namespace
+
+void FindChangesEntireListAdded(PyObject* self) {
+    FinderState& s = finderState(self);
+    addChange(s.contentsChanges, gNames.empty);
+    std::vector<OpenScope> stack;
+    stack.push_back({py::Ref::own(gNames.empty), -1});
+    Py_ssize_t i = 0;
+    while (i < logicalListLength(self)) {
+        py::Ref item = logicalAt(self, i);
+        Logical* logical = requireLogical(item.get());
+        const int indent = logical->fIndent;
+        if (isWhitespace(logical) && indent <= stack.back().indent) {
+            const Py_ssize_t next = route::ProcessDedentedComments(self, i);
+            // The step reports its own failures and answers 0; going on
+            // would restart the walk, so the pass stops there.
+            if (next <= i) return;
+            i = next;
+            continue;
+        }
+        while (indent <= stack.back().indent) {
+            assertThat(stack.size() >= 2);
+            stack.pop_back();
+            if (stack.empty()) raise(PyExc_IndexError, "list index out of range");
+        }
+        PyObject* topName = stack.back().name.get();
+        py::Ref local = py::Ref::none();
+        const bool scopeStart = isScopeStart(logical);
+        if (scopeStart) {
+            // Counted by bare name: a list read before carries indexed
+            // names, which must not count as names of their own.
+            const Py_ssize_t index = UpdateScopesSeenWithStartScopeLogical(self, item.get(), topName, false);
+            local = route::GetLeafScopeWithIndex(self, item.get(), index);
+        }
+        py::Ref top = stack.back().name.copy();
+        py::Ref pair = py::check(PyTuple_Pack(2, top.get(), local.get()));
+        route::SetLogicalScopeNames(self, item.get(), i, pair.get());
+        if (scopeStart && !local.isNone()) {
+            py::Ref full = joinTwoScopeNames(top.get(), local.get());
+            addChange(logical->fKind == kClassLogical ? s.classChanges : s.functionChanges, full.get());
+            addChange(s.contentsChanges, full.get());
+            stack.push_back({std::move(full), indent});
+        }
+        ++i;
+    }
+}
+
+}  // namespace sbc::finder

@@ -1,0 +1,250 @@
+#include "pysource/scopebodycache/function.hpp"
+
+#include <structmember.h>
+
+#include <cstring>
+
+namespace sbc {
+namespace {
+
+struct FunctionObject {
+    PyObject_HEAD
+    const FunctionSpec* spec;
+    PyObject* name;      // str
+    PyObject* qualname;  // str
+    PyObject* module;    // str
+    PyObject* doc;       // str or None
+    bool isMethod;
+};
+
+PyTypeObject FunctionType = {PyVarObject_HEAD_INIT(nullptr, 0)};
+
+[[noreturn]] void countError(const FunctionSpec& spec, Py_ssize_t given) {
+    const bool exact = spec.required == spec.total;
+    Py_ssize_t expected;
+    const char* moreOrLess;
+    if (given < spec.required) {
+        expected = spec.required;
+        moreOrLess = exact ? "exactly" : "at least";
+    } else {
+        expected = spec.total;
+        moreOrLess = exact ? "exactly" : "at most";
+    }
+    PyErr_Format(PyExc_TypeError,
+                 "%.200s() takes %.8s %zd positional argument%.1s (%zd given)", spec.name,
+                 moreOrLess, expected, expected == 1 ? "" : "s", given);
+    py::fail();
+}
+
+const char* checkTypeName(ArgCheck check, PyTypeObject** type) {
+    switch (check) {
+    case ArgCheck::List: *type = &PyList_Type; return "list";
+    case ArgCheck::Str: *type = &PyString_Type; return "str";
+    case ArgCheck::Set: *type = &PySet_Type; return "set";
+    case ArgCheck::Any: break;
+    }
+    *type = nullptr;
+    return nullptr;
+}
+
+int indexOfParam(const FunctionSpec& spec, PyObject* key) {
+    const char* text = PyString_AS_STRING(key);
+    for (int i = 0; i < spec.total; ++i) {
+        if (std::strcmp(spec.params[i].name, text) == 0) return i;
+    }
+    return -1;
+}
+
+}  // namespace
+
+void parseArgs(const FunctionSpec& spec, PyObject* args, PyObject* kwargs, PyObject** argv) {
+    const Py_ssize_t nargs = PyTuple_GET_SIZE(args);
+    const bool haveKeywords = kwargs != nullptr && PyDict_Size(kwargs) > 0;
+    for (int i = 0; i < spec.total; ++i) argv[i] = nullptr;
+
+    // Functions without parameters and single-parameter ones take no keywords.
+    const bool noKeywords = spec.total == 0 || (spec.total == 1 && spec.required == 1 && !spec.isInit);
+    if (noKeywords) {
+        if (haveKeywords) {
+            PyErr_Format(PyExc_TypeError, "%.200s() takes no keyword arguments", spec.name);
+            py::fail();
+        }
+        if (spec.total == 0 && nargs != 0) {
+            PyErr_Format(PyExc_TypeError, "%.200s() takes no arguments (%zd given)", spec.name, nargs);
+            py::fail();
+        }
+        if (spec.total == 1 && nargs != 1) {
+            PyErr_Format(PyExc_TypeError, "%.200s() takes exactly one argument (%zd given)",
+                         spec.name, nargs);
+            py::fail();
+        }
+    } else {
+        if (nargs > spec.total) countError(spec, nargs);
+        for (Py_ssize_t i = 0; i < nargs; ++i) argv[i] = PyTuple_GET_ITEM(args, i);
+        if (haveKeywords) {
+            // Required parameters missing from both are reported before any
+            // keyword is judged.
+            Py_ssize_t taken = 0;
+            for (int i = static_cast<int>(nargs); i < spec.total; ++i) {
+                PyObject* v = PyDict_GetItemString(kwargs, spec.params[i].name);
+                if (v != nullptr) {
+                    argv[i] = v;
+                    ++taken;
+                } else if (i < spec.required) {
+                    countError(spec, i);
+                }
+            }
+            if (taken < PyDict_Size(kwargs)) {
+                PyObject* key;
+                PyObject* value;
+                Py_ssize_t pos = 0;
+                while (PyDict_Next(kwargs, &pos, &key, &value)) {
+                    if (!PyString_Check(key)) {
+                        PyErr_Format(PyExc_TypeError, "%.200s() keywords must be strings", spec.name);
+                        py::fail();
+                    }
+                    const int at = indexOfParam(spec, key);
+                    if (at < 0) {
+                        PyErr_Format(PyExc_TypeError,
+                                     "%.200s() got an unexpected keyword argument '%.200s'",
+                                     spec.name, PyString_AS_STRING(key));
+                        py::fail();
+                    }
+                    if (at < nargs) {
+                        PyErr_Format(PyExc_TypeError,
+                                     "%s() got multiple values for keyword argument '%s'", spec.name,
+                                     PyString_AS_STRING(key));
+                        py::fail();
+                    }
+                }
+            }
+        } else if (nargs < spec.required) {
+            countError(spec, nargs);
+        }
+    }
+    if (noKeywords && spec.total == 1) argv[0] = PyTuple_GET_ITEM(args, 0);
+
+    for (int i = 0; i < spec.total; ++i) {
+        PyTypeObject* type;
+        const char* typeName = checkTypeName(spec.params[i].check, &type);
+        PyObject* v = argv[i];
+        if (type == nullptr || v == nullptr || v == Py_None || Py_TYPE(v) == type) continue;
+        PyErr_Format(PyExc_TypeError,
+                     "Argument '%.200s' has incorrect type (expected %.200s, got %.200s)",
+                     spec.params[i].name, typeName, Py_TYPE(v)->tp_name);
+        py::fail();
+    }
+}
+
+namespace {
+
+PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
+    auto* f = reinterpret_cast<FunctionObject*>(op);
+    return py::guarded([&]() -> PyObject* {
+        PyObject* self = nullptr;
+        py::Ref rest;
+        if (f->isMethod) {
+            // Reached unbound, the first argument is the instance.
+            if (PyTuple_GET_SIZE(args) < 1) {
+                PyErr_Format(PyExc_TypeError, "descriptor '%.200s' needs an argument",
+                             PyString_AS_STRING(f->qualname));
+                py::fail();
+            }
+            self = PyTuple_GET_ITEM(args, 0);
+            rest = py::check(PyTuple_GetSlice(args, 1, PyTuple_GET_SIZE(args)));
+            args = rest.get();
+        }
+        PyObject* argv[kMaxParams];
+        parseArgs(*f->spec, args, kwargs, argv);
+        return f->spec->impl(self, argv);
+    });
+}
+
+PyObject* function_descr_get(PyObject* op, PyObject* obj, PyObject* type) {
+    auto* f = reinterpret_cast<FunctionObject*>(op);
+    if (!f->isMethod) {
+        Py_INCREF(op);
+        return op;
+    }
+    if (obj == Py_None) obj = nullptr;
+    return PyMethod_New(op, obj, type);
+}
+
+void function_dealloc(PyObject* op) {
+    auto* f = reinterpret_cast<FunctionObject*>(op);
+    Py_XDECREF(f->name);
+    Py_XDECREF(f->qualname);
+    Py_XDECREF(f->module);
+    Py_XDECREF(f->doc);
+    Py_TYPE(op)->tp_free(op);
+}
+
+PyObject* function_repr(PyObject* op) {
+    auto* f = reinterpret_cast<FunctionObject*>(op);
+    return PyString_FromFormat("<function %s at %p>", PyString_AS_STRING(f->qualname), op);
+}
+
+// Pickled by reference: module and name.
+PyObject* function_reduce(PyObject* op, PyObject*) {
+    auto* f = reinterpret_cast<FunctionObject*>(op);
+    Py_INCREF(f->qualname);
+    return f->qualname;
+}
+
+PyMethodDef function_methods[] = {
+    {"__reduce__", function_reduce, METH_NOARGS, nullptr},
+    {nullptr, nullptr, 0, nullptr},
+};
+
+PyMemberDef function_members[] = {
+    {const_cast<char*>("__name__"), T_OBJECT, offsetof(FunctionObject, name), READONLY, nullptr},
+    {const_cast<char*>("__qualname__"), T_OBJECT, offsetof(FunctionObject, qualname), READONLY, nullptr},
+    {const_cast<char*>("__module__"), T_OBJECT, offsetof(FunctionObject, module), READONLY, nullptr},
+    {const_cast<char*>("__doc__"), T_OBJECT, offsetof(FunctionObject, doc), READONLY, nullptr},
+    {nullptr, 0, 0, 0, nullptr},
+};
+
+py::Ref makeFunction(const FunctionSpec& spec, const char* qualname, const char* module,
+                     bool isMethod) {
+    py::Ref op = py::check(PyType_GenericAlloc(&FunctionType, 0));
+    auto* f = reinterpret_cast<FunctionObject*>(op.get());
+    f->spec = &spec;
+    f->isMethod = isMethod;
+    f->name = py::check(PyString_InternFromString(spec.name)).release();
+    f->qualname = py::check(PyString_FromString(qualname)).release();
+    f->module = py::check(PyString_InternFromString(module)).release();
+    f->doc = spec.doc ? py::check(PyString_FromString(spec.doc)).release() : py::Ref::none().release();
+    return op;
+}
+
+}  // namespace
+
+void readyFunctionType() {
+    FunctionType.tp_name = "pysource.scopebodycache.function";
+    FunctionType.tp_basicsize = sizeof(FunctionObject);
+    FunctionType.tp_flags = Py_TPFLAGS_DEFAULT;
+    FunctionType.tp_dealloc = function_dealloc;
+    FunctionType.tp_repr = function_repr;
+    FunctionType.tp_call = function_call;
+    FunctionType.tp_descr_get = function_descr_get;
+    FunctionType.tp_methods = function_methods;
+    FunctionType.tp_members = function_members;
+    py::checkStatus(PyType_Ready(&FunctionType));
+}
+
+py::Ref newFunction(const FunctionSpec& spec, const char* module) {
+    return makeFunction(spec, spec.name, module, false);
+}
+
+py::Ref newMethod(const FunctionSpec& spec, PyTypeObject* owner, const char* module) {
+    const char* dot = std::strrchr(owner->tp_name, '.');
+    py::Ref qual = py::check(
+        PyString_FromFormat("%s.%s", dot ? dot + 1 : owner->tp_name, spec.name));
+    return makeFunction(spec, PyString_AS_STRING(qual.get()), module, true);
+}
+
+bool isBoundFormOf(PyObject* callable, PyObject* function) {
+    return PyMethod_Check(callable) && PyMethod_GET_FUNCTION(callable) == function;
+}
+
+}  // namespace sbc

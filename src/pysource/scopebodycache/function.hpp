@@ -1,0 +1,60 @@
+// The module's function object: every Python-visible function and method of
+// the module is one of these, so that each reports its own __module__ and
+// qualified name, and so that one argument parser serves them all.
+#pragma once
+
+#include "common/pyref.hpp"
+
+#include <cstdint>
+
+namespace sbc {
+
+// What the parser checks of a parameter before the function runs.
+enum class ArgCheck : uint8_t {
+    Any,
+    List,   // exactly list, or None
+    Str,    // exactly str, or None
+    Set,    // exactly set, or None
+};
+
+struct Param {
+    const char* name;
+    ArgCheck check;
+};
+
+constexpr int kMaxParams = 4;
+
+// The implementation gets the parsed arguments; a missing optional one is
+// nullptr. `self` is the instance for methods and nullptr for functions.
+using Impl = PyObject* (*)(PyObject* self, PyObject* const* argv);
+
+struct FunctionSpec {
+    const char* name;
+    const char* doc;  // nullptr: no docstring
+    Impl impl;
+    uint8_t required;
+    uint8_t total;
+    Param params[kMaxParams];
+    // __init__ takes keywords even with a single parameter.
+    bool isInit = false;
+};
+
+// Parses `args`/`kwargs` by `spec` into argv[0..spec.total). Throws with the
+// interpreter's argument error set.
+void parseArgs(const FunctionSpec& spec, PyObject* args, PyObject* kwargs, PyObject** argv);
+
+// Makes the function type ready; once, at import.
+void readyFunctionType();
+
+// A module-level function reporting `module` as its __module__.
+py::Ref newFunction(const FunctionSpec& spec, const char* module);
+
+// A method of `owner`: bound through the descriptor protocol, qualified name
+// "<owner>.<name>", __module__ the owner's module.
+py::Ref newMethod(const FunctionSpec& spec, PyTypeObject* owner, const char* module);
+
+// Whether `callable` is the bound form of `function` (our own built-in
+// method as found on an instance).
+bool isBoundFormOf(PyObject* callable, PyObject* function);
+
+}  // namespace sbc

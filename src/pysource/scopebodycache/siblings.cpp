@@ -1,0 +1,229 @@
+#include "pysource/scopebodycache/siblings.hpp"
+
+#include "pysource/contracts/accessors.hpp"
+#include "pysource/contracts/sibling_types.hpp"
+#include "pysource/scopebodycache/names.hpp"
+
+#include <cstring>
+
+namespace sbc {
+
+PyObject* gTimeFunc = nullptr;
+PyTypeObject* gDestroyableType = nullptr;
+SymbolInfo gSymbolInfo;
+PyObject* gModuleDict = nullptr;
+
+namespace {
+
+constexpr const char* kFastaccess = "pysource._fastaccess";
+constexpr const char* kSymbolinfo = "pysource.symbolinfo";
+constexpr const char* kDestroyable = "tallowkit.destroyable";
+
+// The imported module, not its top-level package.
+py::Ref importSubmodule(const char* name) {
+    py::Ref top = py::check(PyImport_ImportModule(name));
+    return top;
+}
+
+// A type attribute of `module`, checked against the size this module was
+// built for; with `vtable`, its native method table must be present too.
+py::Ref importType(const char* moduleName, const char* typeName, Py_ssize_t expectedSize,
+                   bool vtable) {
+    py::Ref module = importSubmodule(moduleName);
+    py::Ref obj = py::check(PyObject_GetAttrString(module.get(), typeName));
+    if (!PyType_Check(obj.get())) {
+        PyErr_Format(PyExc_TypeError, "%.200s.%.200s is not a type object", moduleName, typeName);
+        py::fail();
+    }
+    auto* type = reinterpret_cast<PyTypeObject*>(obj.get());
+    if (type->tp_basicsize < expectedSize) {
+        PyErr_Format(PyExc_ValueError,
+                     "%.200s.%.200s size changed, may indicate binary incompatibility. "
+                     "Expected %zd from C header, got %zd from PyObject",
+                     moduleName, typeName, expectedSize, type->tp_basicsize);
+        py::fail();
+    }
+    if (type->tp_basicsize > expectedSize) {
+        char warning[400];
+        PyOS_snprintf(warning, sizeof warning,
+                      "%s.%s size changed, may indicate binary incompatibility. "
+                      "Expected %zd from C header, got %zd from PyObject",
+                      moduleName, typeName, expectedSize, type->tp_basicsize);
+        py::checkStatus(PyErr_WarnEx(nullptr, warning, 0));
+    }
+    if (vtable) {
+        PyObject* capsule = type->tp_dict
+                                ? PyDict_GetItemString(type->tp_dict, contracts::kVtableAttr)
+                                : nullptr;
+        if (capsule == nullptr || !PyCapsule_CheckExact(capsule) ||
+            PyCapsule_GetPointer(capsule, PyCapsule_GetName(capsule)) == nullptr) {
+            PyErr_Clear();
+            PyErr_SetString(PyExc_RuntimeError, "invalid vtable found for imported type");
+            py::fail();
+        }
+    }
+    return obj;
+}
+
+// The capsule of entry `name` in the module's table; `what` is "variable" or
+// "function" for the messages.
+void* entryPoint(const char* moduleName, const char* name, const char* signature, bool isFunction) {
+    py::Ref module = importSubmodule(moduleName);
+    py::Ref table = py::check(PyObject_GetAttrString(module.get(), contracts::kCapiAttr));
+    PyObject* capsule = PyDict_Check(table.get()) ? PyDict_GetItemString(table.get(), name) : nullptr;
+    if (capsule == nullptr) {
+        PyErr_Format(PyExc_ImportError,
+                     isFunction ? "%.200s does not export expected C function %.200s"
+                                : "%.200s does not export expected C variable %.200s",
+                     moduleName, name);
+        py::fail();
+    }
+    const char* declared = PyCapsule_CheckExact(capsule) ? PyCapsule_GetName(capsule) : nullptr;
+    if (declared == nullptr || std::strcmp(declared, signature) != 0) {
+        PyErr_Clear();
+        PyErr_Format(PyExc_TypeError,
+                     isFunction ? "C function %.200s.%.200s has wrong signature (expected %.500s, got %.500s)"
+                                : "C variable %.200s.%.200s has wrong signature (expected %.500s, got %.500s)",
+                     moduleName, name, signature, declared ? declared : "(null)");
+        py::fail();
+    }
+    void* p = PyCapsule_GetPointer(capsule, declared);
+    if (p == nullptr) py::fail();
+    return p;
+}
+
+PyObject* objectVariable(const char* moduleName, const char* name) {
+    return *static_cast<PyObject**>(entryPoint(moduleName, name, contracts::sig::kObject, false));
+}
+
+char charVariable(const char* moduleName, const char* name) {
+    return *static_cast<char*>(entryPoint(moduleName, name, contracts::sig::kChar, false));
+}
+
+}  // namespace
+
+void bindDestroyableBase() {
+    py::Ref type = importType(kDestroyable, "CDestroyable", sizeof(contracts::DestroyableObject), true);
+    gDestroyableType = reinterpret_cast<PyTypeObject*>(type.release());
+}
+
+void checkOtherTypes() {
+    using contracts::PlainSiblingObject;
+    using contracts::VtabSiblingObject;
+    py::Ref builtins = py::check(PyImport_ImportModule("__builtin__"));
+    py::Ref typeType = importType("__builtin__", "type", sizeof(PyHeapTypeObject), false);
+    importType(kFastaccess, "CLogger", sizeof(PlainSiblingObject), false);
+    importType(kFastaccess, "CBytesTokenizer", sizeof(VtabSiblingObject), true);
+    importType(kSymbolinfo, "CSingleResolvedInfo", sizeof(VtabSiblingObject), true);
+    importType(kSymbolinfo, "CFullyScopedName", sizeof(PlainSiblingObject), false);
+    importType(kSymbolinfo, "CDefInfo", sizeof(PlainSiblingObject), false);
+    importType(kDestroyable, "_CHandlerRecord", sizeof(PlainSiblingObject), false);
+    importType(kDestroyable, "_CEmissionStackItem", sizeof(PlainSiblingObject), false);
+}
+
+void bindVariables() {
+    using namespace contracts::sig;
+    PyObject* logicalType = objectVariable(kFastaccess, "LogicalLineType");
+    if (!PyType_Check(logicalType)) {
+        PyErr_Format(PyExc_TypeError, "%.200s.%.200s is not a type object", kFastaccess,
+                     "LogicalLineType");
+        py::fail();
+    }
+    Py_INCREF(logicalType);
+    contracts::gLogicalLineType = reinterpret_cast<PyTypeObject*>(logicalType);
+    gTimeFunc = objectVariable(kFastaccess, "__TimeFunc");
+    Py_XINCREF(gTimeFunc);
+
+    // Every symbol-info variable is checked; only four are read.
+#define SBC_PAIR(stem)                                  \
+    objectVariable(kSymbolinfo, "k" #stem "Prefix");    \
+    charVariable(kSymbolinfo, "k" #stem "Kind");
+    SYMBOLINFO_PREFIX_KIND_STEMS(SBC_PAIR)
+    objectVariable(kSymbolinfo, "kClassInstanceSuffix");
+    SYMBOLINFO_PREFIX_KIND_STEMS2(SBC_PAIR)
+    objectVariable(kSymbolinfo, "kPlainEquivSpec");
+    gSymbolInfo.kPlainEquivKind = charVariable(kSymbolinfo, "kPlainEquivKind");
+    SYMBOLINFO_PREFIX_KIND_STEMS3(SBC_PAIR)
+#undef SBC_PAIR
+    gSymbolInfo.kMethodKind = charVariable(kSymbolinfo, "kMethodKind");
+    gSymbolInfo.kUnboundMethodKind = charVariable(kSymbolinfo, "kUnboundMethodKind");
+    gSymbolInfo.kFunctionKind = charVariable(kSymbolinfo, "kFunctionKind");
+    objectVariable(kSymbolinfo, "kIterationSubscript");
+    objectVariable(kSymbolinfo, "kTypingModuleSymbolDot");
+    objectVariable(kSymbolinfo, "kTypingModuleSymbol");
+    entryPoint(kSymbolinfo, "kPrefixLen", kSsize, false);
+    objectVariable(kSymbolinfo, "kScopeIndexSep");
+    objectVariable(kSymbolinfo, "kModuleScopeName");
+
+    for (const char* name : {"_gEmissionStack", "_gClassSignalHandlers", "_gSignalsForCls",
+                             "_kEmptyFrozenset", "_gQObjectClass"}) {
+        objectVariable(kDestroyable, name);
+    }
+    entryPoint(kDestroyable, "_gLogAllEmissions", kInt, false);
+    entryPoint(kDestroyable, "_gTriedToImportQObject", kInt, false);
+}
+
+void bindFunctions() {
+    using namespace contracts;
+    gSymbolInfo.joinTwoScopeNames = reinterpret_cast<JoinTwoScopeNamesFn>(
+        entryPoint(kSymbolinfo, "JoinTwoScopeNames", sig::kJoinTwo, true));
+    gSymbolInfo.splitScopeNameFromSuffixes = reinterpret_cast<SplitScopeNameFromSuffixesFn>(
+        entryPoint(kSymbolinfo, "SplitScopeNameFromSuffixes", sig::kSplitOne, true));
+    gSymbolInfo.splitScopeNames = reinterpret_cast<SplitScopeNamesFn>(
+        entryPoint(kSymbolinfo, "SplitScopeNames", sig::kSplitOne, true));
+    gSymbolInfo.appendScopeSuffixes = reinterpret_cast<AppendScopeSuffixesFn>(
+        entryPoint(kSymbolinfo, "AppendScopeSuffixes", sig::kAppendSuffixes, true));
+}
+
+PyObject* lookupGlobal(PyObject* name) {
+    PyObject* v = PyDict_GetItem(gModuleDict, name);
+    if (v == nullptr) v = PyDict_GetItem(PyEval_GetBuiltins(), name);
+    if (v == nullptr) {
+        PyErr_Format(PyExc_NameError, "name '%.200s' is not defined", PyString_AS_STRING(name));
+        py::fail();
+    }
+    return v;
+}
+
+py::Ref joinTwoScopeNames(PyObject* scope, PyObject* name) {
+    return py::check(gSymbolInfo.joinTwoScopeNames(scope, name, 0));
+}
+
+py::Ref splitScopeNames(PyObject* full) { return py::check(gSymbolInfo.splitScopeNames(full, 0)); }
+
+py::Ref splitScopeNameFromSuffixes(PyObject* name) {
+    return py::check(gSymbolInfo.splitScopeNameFromSuffixes(name, 0));
+}
+
+py::Ref appendScopeSuffixes(PyObject* name, PyObject* index) {
+    return py::check(gSymbolInfo.appendScopeSuffixes(name, index, Py_None, 0));
+}
+
+namespace {
+// `module_global.attribute`, looked up anew.
+py::Ref siblingFunction(PyObject* moduleGlobal, PyObject* attribute) {
+    py::Ref module = py::Ref::own(lookupGlobal(moduleGlobal));
+    return py::check(PyObject_GetAttr(module.get(), attribute));
+}
+}  // namespace
+
+Py_ssize_t indexForLineno(PyObject* logicalList, long lineno) {
+    py::Ref fn = siblingFunction(gNames.fastaccess, gNames.IndexForLineno);
+    py::Ref line = py::check(PyInt_FromLong(lineno));
+    py::Ref r = py::check(PyObject_CallFunctionObjArgs(fn.get(), logicalList, line.get(), nullptr));
+    return py::asIndex(r.get());
+}
+
+Py_ssize_t findIndexOfLogical(PyObject* logicalList, PyObject* logical) {
+    py::Ref fn = siblingFunction(gNames.fastaccess, gNames.FindIndexOfLogical);
+    py::Ref r = py::check(PyObject_CallFunctionObjArgs(fn.get(), logicalList, logical, nullptr));
+    return py::asIndex(r.get());
+}
+
+bool leafScopeNameHasIndex(PyObject* name) {
+    py::Ref fn = siblingFunction(gNames.symbolinfo, gNames.LeafScopeNameHasIndex);
+    py::Ref r = py::check(PyObject_CallFunctionObjArgs(fn.get(), name, nullptr));
+    return py::truth(r.get());
+}
+
+}  // namespace sbc
