@@ -1,6 +1,8 @@
 #!/usr/bin/env bash
 # The Python 2.7 interpreter the project builds against.
 set -euo pipefail
+root=$(cd "$(dirname "$0")/.." && pwd)
+export PYTHONPATH="$root/build/python${PYTHONPATH:+:$PYTHONPATH}"
 if [ -n "${PYTHON27:-}" ]; then exec "$PYTHON27" "$@"; fi
 for p in "$(pyenv root 2>/dev/null)/versions/2.7.18/bin/python2.7" "$HOME/.pyenv/versions/2.7.18/bin/python2.7"; do
   if [ -x "$p" ]; then exec "$p" "$@"; fi
