@@ -29,10 +29,10 @@ void FindChangesEntireListAdded(PyObject* self) {
         const int indent = logical->fIndent;
         if (isWhitespace(logical) && indent <= stack.back().indent) {
             const Py_ssize_t next = route::ProcessDedentedComments(self, i);
-            // The step reports its own failures and answers 0; going on
-            // would restart the walk, so the pass stops there.
-            if (next <= i) return;
-            i = next;
+            // The step reports its own failures and answers 0; restarting
+            // the walk there could loop for ever.
+            assertThat(next > i);
+            i = next > i ? next : i + 1;
             continue;
         }
         while (indent <= stack.back().indent) {
