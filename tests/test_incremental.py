@@ -172,6 +172,9 @@ class CommentAndBlankRuns(unittest.TestCase):
         self.check("def f():\n    x = 1\n", "def f():\n    x = 1\n# end\n")
         self.check("def f():\n    x = 1\n# a\n", "def f():\n    x = 1\n# a\n    # b\n\n")
 
+    def test_removing_the_last_line_moves_the_run_before_it(self):
+        self.check("def f():\n    x = 1\n\n        y = 2\n", "def f():\n    x = 1\n\n")
+
     def test_comment_inserted_between_a_header_and_its_body(self):
         self.check("class A:\n    x = 1\n", "class A:\n# note\n    x = 1\n")
 

@@ -1,26 +1,393 @@
+// CScopeBodyCache: resolves a full dotted scope name one level at a time
+// through the cached body of its parent, and caches both the defining
+// logical and the body list under that name until the owner clears them.
+//
+// The lookups call each other as ordinary methods on the instance, so an
+// override in a Python subclass takes part in every resolution. Nothing here
+// watches the logical list: a cached entry is trusted until Clear.
 #include "pysource/scopebodycache/bodycache.hpp"
 
+#include "pysource/contracts/accessors.hpp"
+#include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/function.hpp"
+#include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
 namespace sbc {
 
+using namespace contracts;
+
 Py_ssize_t gBodyCacheStateOffset = 0;
 
 namespace {
+
 PyTypeObject BodyCacheType = {PyVarObject_HEAD_INIT(nullptr, 0)};
+
+PyObject* gDot = nullptr;   // "."
+PyObject* gJoin = nullptr;  // "join"
+
+// --- Small helpers with the semantics of the Python operations ------------
+
+// dict.get(key, None) on a field that may be None; a stored None counts as
+// absent. PyDict_GetItem swallows lookup errors in 2.7, so a miss is
+// confirmed by a lookup that reports them.
+py::Ref cacheGet(PyObject* field, PyObject* key) {
+    if (field == Py_None) raiseNoneAttribute("get");
+    py::Ref dict = py::Ref::own(field);
+    PyObject* v = PyDict_GetItem(dict.get(), key);
+    if (v == nullptr) {
+        if (py::checkStatus(PyDict_Contains(dict.get(), key)) == 0) return py::Ref();
+        v = PyDict_GetItem(dict.get(), key);
+    }
+    if (v == nullptr || v == Py_None) return py::Ref();
+    return py::Ref::own(v);
 }
+
+// field[key] = value; the field may have been emptied to None by Python code
+// that ran while the value was computed.
+void cacheStore(PyObject* field, PyObject* key, PyObject* value) {
+    if (field == Py_None) raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
+    py::Ref dict = py::Ref::own(field);
+    py::checkStatus(PyDict_SetItem(dict.get(), key, value));
+}
+
+// field.pop(key, None), the result dropped.
+void cachePop(PyObject* field, PyObject* key) {
+    if (field == Py_None) raiseNoneAttribute("pop");
+    py::Ref dict = py::Ref::own(field);
+    if (py::checkStatus(PyDict_Contains(dict.get(), key)) == 0) return;
+    if (PyDict_DelItem(dict.get(), key) < 0) {
+        // A key's __eq__ may have removed it in between.
+        if (!PyErr_ExceptionMatches(PyExc_KeyError)) py::fail();
+        PyErr_Clear();
+    }
+}
+
+void cacheClear(PyObject* field) {
+    if (field == Py_None) raiseNoneAttribute("clear");
+    py::Ref dict = py::Ref::own(field);
+    PyDict_Clear(dict.get());
+}
+
+py::Ref callMethod(PyObject* self, PyObject* name, PyObject* arg) {
+    return py::check(PyObject_CallMethodObjArgs(self, name, arg, nullptr));
+}
+
+// `for item in seq`: exact lists and tuples by index against their live
+// size, anything else through the iterator protocol. `body` returns false
+// to stop early.
+template <class Body>
+void forEach(PyObject* seq, Body&& body) {
+    if (PyList_CheckExact(seq) || PyTuple_CheckExact(seq)) {
+        py::Ref keep = py::Ref::own(seq);
+        const bool isList = PyList_CheckExact(seq);
+        for (Py_ssize_t i = 0;; ++i) {
+            const Py_ssize_t n = isList ? PyList_GET_SIZE(seq) : PyTuple_GET_SIZE(seq);
+            if (i >= n) return;
+            py::Ref item = py::Ref::own(isList ? PyList_GET_ITEM(seq, i) : PyTuple_GET_ITEM(seq, i));
+            if (!body(item.get())) return;
+        }
+    }
+    py::Ref it = py::check(PyObject_GetIter(seq));
+    for (;;) {
+        PyObject* next = PyIter_Next(it.get());
+        if (next == nullptr) {
+            if (PyErr_Occurred()) py::fail();
+            return;
+        }
+        py::Ref item = py::Ref::steal(next);
+        if (!body(item.get())) return;
+    }
+}
+
+// --- The lookups ------------------------------------------------------------
+
+py::Ref getScopeDef(PyObject* self, PyObject* scopeName) {
+    if (py::Ref cached = cacheGet(bodyCacheState(self).scopeDefCache, scopeName)) return cached;
+    py::Ref def = callMethod(self, gNames.FindScopeDef, scopeName);
+    cacheStore(bodyCacheState(self).scopeDefCache, scopeName, def.get());
+    return def;
+}
+
+py::Ref getBodyOfScope(PyObject* self, PyObject* scopeName) {
+    if (py::Ref cached = cacheGet(bodyCacheState(self).scopeBodyCache, scopeName)) return cached;
+    py::Ref def = callMethod(self, gNames.GetScopeDef, scopeName);
+    py::Ref body = callMethod(self, gNames.FindBodyOfScopeDef, def.get());
+    cacheStore(bodyCacheState(self).scopeBodyCache, scopeName, body.get());
+    return body;
+}
+
+py::Ref parentScopeName(PyObject* parts, Py_ssize_t count) {
+    if (count == 1) return py::Ref::own(gNames.empty);
+    if (count == 2) return py::check(PySequence_GetItem(parts, 0));
+    py::Ref ancestors = py::check(PySequence_GetSlice(parts, 0, count - 1));
+    py::Ref dot = py::Ref::own(gDot);
+    return py::check(PyObject_CallMethodObjArgs(dot.get(), gJoin, ancestors.get(), nullptr));
+}
+
+py::Ref findScopeDef(PyObject* self, PyObject* scopeName) {
+    if (py::checkSize(PyObject_Size(scopeName)) == 0) return py::Ref::none();
+    py::Ref parts = splitScopeNames(scopeName);
+    const Py_ssize_t count = py::checkSize(PyObject_Size(parts.get()));
+    py::Ref parentName = parentScopeName(parts.get(), count);
+    py::Ref leafName = py::check(PySequence_GetItem(parts.get(), -1));
+    py::Ref parentBody = callMethod(self, gNames.GetBodyOfScope, parentName.get());
+
+    py::Ref found;
+    forEach(parentBody.get(), [&](PyObject* logical) {
+        const Logical* l = requireLogical(logical);
+        py::Ref defined = py::Ref::own(localScopeDefinedChecked(l));
+        // Logicals that define nothing compare as None, which a name never equals.
+        if (!defined) return true;
+        if (!py::checkStatus(PyObject_RichCompareBool(defined.get(), leafName.get(), Py_EQ))) return true;
+        found = py::Ref::own(logical);
+        return false;
+    });
+    if (!found) raiseWithRepr(PyExc_KeyError, msg::kNoScopeFound, scopeName);
+    return found;
+}
+
+py::Ref findBodyOfScopeDef(PyObject* self, PyObject* scopeDef) {
+    Py_ssize_t first = 0;
+    long defIndent = -1;
+    if (scopeDef != Py_None) {
+        const Logical* def = requireLogical(scopeDef);
+        if (!isScopeStart(def)) raiseWithRepr(PyExc_ValueError, msg::kMustStartScope, scopeDef);
+        py::Ref list = py::Ref::own(bodyCacheState(self).logicalList);
+        first = findIndexOfLogical(list.get(), scopeDef) + 1;
+        if (first == 0) raise(PyExc_IndexError, msg::kDefNotInList);
+        defIndent = def->fIndent;
+    }
+
+    py::Ref list = py::Ref::own(bodyCacheState(self).logicalList);
+    if (list.isNone()) raise(PyExc_TypeError, msg::kNoneHasNoLen);
+    const Py_ssize_t end = PyList_GET_SIZE(list.get());
+    py::Ref body = py::check(PyList_New(0));
+    long nestedIndent = -1;  // -1: not inside a nested class or def
+    // No Python code runs in this loop, but the length was taken once: a
+    // list that shrank since is an IndexError as for list[i].
+    for (Py_ssize_t i = first; i < end; ++i) {
+        if (i >= PyList_GET_SIZE(list.get())) raise(PyExc_IndexError, "list index out of range");
+        PyObject* logical = PyList_GET_ITEM(list.get(), i);
+        const Logical* l = requireLogical(logical);
+        if (isWhitespace(l)) continue;
+        const long indent = l->fIndent;
+        if (indent <= defIndent) break;
+        if (nestedIndent != -1) {
+            if (indent > nestedIndent) continue;
+            nestedIndent = -1;
+        }
+        py::checkStatus(PyList_Append(body.get(), logical));
+        if (isScopeStart(l)) nestedIndent = indent;
+    }
+    return body;
+}
+
+void destroyImpl(PyObject* self) {
+    BodyCacheState& s = bodyCacheState(self);
+    py::storeSlot(&s.scopeBodyCache, Py_None);
+    py::storeSlot(&s.scopeDefCache, Py_None);
+}
+
+void clear(PyObject* self, PyObject* scopeNames) {
+    forEach(scopeNames, [&](PyObject* item) {
+        if (py::checkSize(PyObject_Size(item)) == 1 &&
+            py::checkStatus(PyObject_RichCompareBool(item, gNames.star, Py_EQ))) {
+            cacheClear(bodyCacheState(self).scopeBodyCache);
+            cacheClear(bodyCacheState(self).scopeDefCache);
+            return false;
+        }
+        cachePop(bodyCacheState(self).scopeBodyCache, item);
+        cachePop(bodyCacheState(self).scopeDefCache, item);
+        return true;
+    });
+}
+
+// --- Type slots -------------------------------------------------------------
+
+// As for CChangeFinder: a heap-type base's subtype_* slots would start again
+// from the instance's type and come back here.
+bool baseSlotsChain() noexcept { return !(gDestroyableType->tp_flags & Py_TPFLAGS_HEAPTYPE); }
+
+DestroyableObject* base(PyObject* self) noexcept { return reinterpret_cast<DestroyableObject*>(self); }
+
+PyObject* cache_new(PyTypeObject* type, PyObject* args, PyObject* kwargs) {
+    PyObject* self = gDestroyableType->tp_new(type, args, kwargs);
+    if (self == nullptr) return nullptr;
+    BodyCacheState& s = bodyCacheState(self);
+    for (PyObject** field : {&s.logicalList, &s.scopeBodyCache, &s.scopeDefCache}) {
+        Py_INCREF(Py_None);
+        *field = Py_None;
+    }
+    return self;
+}
+
+int cache_traverse(PyObject* self, visitproc visit, void* arg) {
+    BodyCacheState& s = bodyCacheState(self);
+    Py_VISIT(s.logicalList);
+    Py_VISIT(s.scopeBodyCache);
+    Py_VISIT(s.scopeDefCache);
+    if (baseSlotsChain()) {
+        if (gDestroyableType->tp_traverse) return gDestroyableType->tp_traverse(self, visit, arg);
+        return 0;
+    }
+    Py_VISIT(base(self)->fSignalCatchers);
+    return 0;
+}
+
+int cache_clear(PyObject* self) {
+    BodyCacheState& s = bodyCacheState(self);
+    for (PyObject** field : {&s.logicalList, &s.scopeBodyCache, &s.scopeDefCache}) {
+        py::storeSlot(field, Py_None);
+    }
+    if (baseSlotsChain()) {
+        if (gDestroyableType->tp_clear) return gDestroyableType->tp_clear(self);
+        return 0;
+    }
+    py::storeSlot(&base(self)->fSignalCatchers, Py_None);
+    return 0;
+}
+
+void cache_dealloc(PyObject* self) {
+    PyObject_GC_UnTrack(self);
+    BodyCacheState& s = bodyCacheState(self);
+    Py_CLEAR(s.logicalList);
+    Py_CLEAR(s.scopeBodyCache);
+    Py_CLEAR(s.scopeDefCache);
+    if (baseSlotsChain()) {
+        gDestroyableType->tp_dealloc(self);
+        return;
+    }
+    Py_CLEAR(base(self)->fSignalCatchers);
+    Py_TYPE(self)->tp_free(self);
+}
+
+const FunctionSpec kInitSpec = {"__init__", nullptr, nullptr, 1, 1, {{"logical_list", ArgCheck::Any}},
+                                true};
+
+int cache_init(PyObject* self, PyObject* args, PyObject* kwargs) {
+    return py::guardedStatus([&] {
+        PyObject* argv[kMaxParams];
+        parseArgs(kInitSpec, args, kwargs, argv);
+        py::Ref result = py::check(PyObject_CallMethod(reinterpret_cast<PyObject*>(gDestroyableType),
+                                                       const_cast<char*>("__init__"),
+                                                       const_cast<char*>("(O)"), self));
+        setBodyCacheLogicalList(self, argv[0]);
+        BodyCacheState& s = bodyCacheState(self);
+        py::Ref bodies = py::check(PyDict_New());
+        py::storeSlot(&s.scopeBodyCache, bodies.get());
+        py::Ref defs = py::check(PyDict_New());
+        py::storeSlot(&s.scopeDefCache, defs.get());
+        return 0;
+    });
+}
+
+PyObject* fieldOrNone(PyObject* field) { return py::Ref::own(field ? field : Py_None).release(); }
+
+PyObject* get_logical_list(PyObject* self, void*) { return fieldOrNone(bodyCacheState(self).logicalList); }
+PyObject* get_body_cache(PyObject* self, void*) { return fieldOrNone(bodyCacheState(self).scopeBodyCache); }
+PyObject* get_def_cache(PyObject* self, void*) { return fieldOrNone(bodyCacheState(self).scopeDefCache); }
+
+PyGetSetDef cache_getset[] = {
+    {const_cast<char*>("_fLogicalList"), get_logical_list, nullptr, nullptr, nullptr},
+    {const_cast<char*>("_fScopeBodyCache"), get_body_cache, nullptr, nullptr, nullptr},
+    {const_cast<char*>("_fScopeDefCache"), get_def_cache, nullptr, nullptr, nullptr},
+    {nullptr, nullptr, nullptr, nullptr, nullptr},
+};
+
+// --- Python-visible methods -------------------------------------------------
+
+// Our methods can be reached unbound through the class dict; the fields are
+// only there on instances of the class.
+void requireInstance(PyObject* self, const char* method) {
+    if (PyObject_TypeCheck(self, &BodyCacheType)) return;
+    PyErr_Format(PyExc_TypeError, "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
+                 method, BodyCacheType.tp_name, Py_TYPE(self)->tp_name);
+    py::fail();
+}
+
+PyObject* m_destroy_impl(PyObject* self, PyObject* const*) {
+    requireInstance(self, "_destroy_impl");
+    destroyImpl(self);
+    return py::Ref::none().release();
+}
+PyObject* m_GetBodyOfScope(PyObject* self, PyObject* const* a) {
+    requireInstance(self, "GetBodyOfScope");
+    return getBodyOfScope(self, a[0]).release();
+}
+PyObject* m_Clear(PyObject* self, PyObject* const* a) {
+    requireInstance(self, "Clear");
+    clear(self, a[0] ? a[0] : gNames.star);
+    return py::Ref::none().release();
+}
+PyObject* m_GetScopeDef(PyObject* self, PyObject* const* a) {
+    requireInstance(self, "GetScopeDef");
+    return getScopeDef(self, a[0]).release();
+}
+PyObject* m_FindScopeDef(PyObject* self, PyObject* const* a) {
+    requireInstance(self, "_FindScopeDef");
+    return findScopeDef(self, a[0]).release();
+}
+PyObject* m_FindBodyOfScopeDef(PyObject* self, PyObject* const* a) {
+    requireInstance(self, "_FindBodyOfScopeDef");
+    return findBodyOfScopeDef(self, a[0]).release();
+}
+
+constexpr Param kScopeName{"scope_name", ArgCheck::Any};
+
+const FunctionSpec kMethods[] = {
+    {"_destroy_impl", nullptr, m_destroy_impl, 0, 0, {}},
+    {"GetBodyOfScope", nullptr, m_GetBodyOfScope, 1, 1, {kScopeName}},
+    {"Clear", nullptr, m_Clear, 0, 1, {{"scope_names", ArgCheck::Any}}},
+    {"GetScopeDef", nullptr, m_GetScopeDef, 1, 1, {kScopeName}},
+    {"_FindScopeDef",
+     " Finds the scope def for the name without using the _fScopeDefCache\n"
+     "    for the name (this is used to find the value to put in the cache).\n"
+     "    Raises KeyError if scope isn't found",
+     m_FindScopeDef, 1, 1, {kScopeName}},
+    {"_FindBodyOfScopeDef", nullptr, m_FindBodyOfScopeDef, 1, 1, {{"scope_def", ArgCheck::Any}}},
+};
+
+}  // namespace
 
 PyTypeObject* scopeBodyCacheType() noexcept { return &BodyCacheType; }
 
+void setBodyCacheLogicalList(PyObject* self, PyObject* value) {
+    if (value != Py_None && !PyList_CheckExact(value)) raiseExpectedType("list", value);
+    py::storeSlot(&bodyCacheState(self).logicalList, value);
+}
+
+void setBodyCacheDict(PyObject** field, PyObject* value) {
+    if (value != Py_None && !PyDict_CheckExact(value)) raiseExpectedType("dict", value);
+    py::storeSlot(field, value);
+}
+
 void readyScopeBodyCacheType() {
-    gBodyCacheStateOffset = gDestroyableType->tp_basicsize;
+    gDot = py::check(PyString_InternFromString(".")).release();
+    gJoin = py::check(PyString_InternFromString("join")).release();
+    // Our fields go after the base's instance, whatever its size turned out to be.
+    gBodyCacheStateOffset = (gDestroyableType->tp_basicsize + alignof(BodyCacheState) - 1) /
+                            alignof(BodyCacheState) * alignof(BodyCacheState);
     BodyCacheType.tp_name = "pysource.scopebodycache.CScopeBodyCache";
     BodyCacheType.tp_basicsize = gBodyCacheStateOffset + sizeof(BodyCacheState);
-    BodyCacheType.tp_flags = Py_TPFLAGS_DEFAULT | Py_TPFLAGS_BASETYPE;
+    BodyCacheType.tp_flags = Py_TPFLAGS_DEFAULT | Py_TPFLAGS_BASETYPE | Py_TPFLAGS_HAVE_GC;
     BodyCacheType.tp_base = gDestroyableType;
+    BodyCacheType.tp_new = cache_new;
+    BodyCacheType.tp_init = cache_init;
+    BodyCacheType.tp_dealloc = cache_dealloc;
+    BodyCacheType.tp_traverse = cache_traverse;
+    BodyCacheType.tp_clear = cache_clear;
+    BodyCacheType.tp_getset = cache_getset;
     py::checkStatus(PyType_Ready(&BodyCacheType));
 }
 
-void bindScopeBodyCacheMethods() {}
+void bindScopeBodyCacheMethods() {
+    PyObject* dict = BodyCacheType.tp_dict;
+    for (const FunctionSpec& spec : kMethods) {
+        py::Ref f = newMethod(spec, &BodyCacheType, "pysource.scopebodycache");
+        py::checkStatus(PyDict_SetItemString(dict, spec.name, f.get()));
+    }
+    PyType_Modified(&BodyCacheType);
+}
 
 }  // namespace sbc

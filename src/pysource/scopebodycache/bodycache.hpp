@@ -23,4 +23,8 @@ PyTypeObject* scopeBodyCacheType() noexcept;
 void readyScopeBodyCacheType();
 void bindScopeBodyCacheMethods();
 
+// Field stores with the type rules of the fields ("Expected list, got X").
+void setBodyCacheLogicalList(PyObject* self, PyObject* value);
+void setBodyCacheDict(PyObject** field, PyObject* value);  // exact dict or None
+
 }  // namespace sbc

@@ -17,8 +17,13 @@ py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList) {
         py::Ref scope = py::Ref::own(scopeName(logical));
         if (scope.isNone()) continue;
         route::LogicalInScopeChanged(self, item.get(), scope.get());
-        const Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno);
-        if (index != lastIndex && index >= 0 && index < logicalListLength(self)) {
+        Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno);
+        // A logical removed from the end of the list still moves the comment
+        // and blank lines before it (they took their scope from it): the last
+        // logical stands in its place.
+        const Py_ssize_t n = logicalListLength(self);
+        if (index >= n && n > 0) index = n - 1;
+        if (index != lastIndex && index >= 0 && index < n) {
             py::Ref value = py::check(PyInt_FromSsize_t(index));
             py::checkStatus(PyList_Append(result.get(), value.get()));
         }

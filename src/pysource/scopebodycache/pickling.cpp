@@ -1,8 +1,316 @@
+// Pickling and copying of CChangeFinder and CScopeBodyCache.
+//
+// An object travels as a tuple of its fields sorted by field name (the base
+// class's two fields first) plus, for a Python subclass, its __dict__. A
+// checksum of the field list goes with it, so that a pickle made with
+// another field list is refused rather than loaded into the wrong fields.
+// Both classes share one reduce, one rebuild and one state applier, driven
+// by a table of their fields.
 #include "pysource/scopebodycache/pickling.hpp"
 
-namespace sbc {
+#include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/bodycache.hpp"
+#include "pysource/scopebodycache/finder.hpp"
+#include "pysource/scopebodycache/function.hpp"
+#include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/siblings.hpp"
 
-void installPickling(PyTypeObject*) {}
-void bindUnpickleFunctions(PyObject*) {}
+namespace sbc {
+namespace {
+
+constexpr const char kModule[] = "pysource.scopebodycache";
+
+enum class FieldKind : uint8_t {
+    Destroyed,  // the base's flag, stored as True/False
+    Object,     // an object slot; None or the type its store checks
+    Index,      // a Py_ssize_t, stored as an int
+};
+
+struct Field {
+    FieldKind kind;
+    PyObject* (*read)(PyObject* self);                 // Object: borrowed, never null
+    void (*store)(PyObject* self, PyObject* value);    // Object: checks the type
+    Py_ssize_t* (*index)(PyObject* self);              // Index
+};
+
+constexpr int kMaxFields = 10;
+
+struct PickledClass {
+    PyTypeObject* (*type)() noexcept;
+    long checksum;
+    const char* checksumMessage;  // one %zd: the checksum found in the pickle
+    PyObject* Names::*rebuildName;
+    int fieldCount;
+    Field fields[kMaxFields];
+};
+
+contracts::DestroyableObject* base(PyObject* self) noexcept {
+    return reinterpret_cast<contracts::DestroyableObject*>(self);
+}
+
+PyObject* orNone(PyObject* o) noexcept { return o != nullptr ? o : Py_None; }
+
+// --- The field tables, in the order of the state tuple ----------------------
+
+const Field kDestroyed = {FieldKind::Destroyed, nullptr, nullptr, nullptr};
+
+const Field kSignalCatchers = {
+    FieldKind::Object, [](PyObject* self) { return orNone(base(self)->fSignalCatchers); },
+    [](PyObject* self, PyObject* value) {
+        if (value != Py_None && !PyDict_CheckExact(value)) raiseExpectedType("dict", value);
+        py::storeSlot(&base(self)->fSignalCatchers, value);
+    },
+    nullptr};
+
+const PickledClass kChangeFinder = {
+    changeFinderType,
+    0x093a2af,
+    "Incompatible checksums (%zd vs 0x093a2af = (__fDestroyed, __fSignalCatchers, "
+    "_fCurrentClassChanges, _fCurrentContentsChanges, _fCurrentFunctionChanges, "
+    "_fEndIndexForScopesSeen, _fLastProcessedIndex, _fLogicalList, _fNextChangeIndex, "
+    "_fScopesSeen))",
+    &Names::unpickleChangeFinder,
+    10,
+    {
+        kDestroyed,
+        kSignalCatchers,
+        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).classChanges); },
+         [](PyObject* self, PyObject* v) { setChangeSet(&finderState(self).classChanges, v); }, nullptr},
+        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).contentsChanges); },
+         [](PyObject* self, PyObject* v) { setChangeSet(&finderState(self).contentsChanges, v); }, nullptr},
+        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).functionChanges); },
+         [](PyObject* self, PyObject* v) { setChangeSet(&finderState(self).functionChanges, v); }, nullptr},
+        {FieldKind::Index, nullptr, nullptr,
+         [](PyObject* self) { return &finderState(self).endIndexForScopesSeen; }},
+        {FieldKind::Index, nullptr, nullptr,
+         [](PyObject* self) { return &finderState(self).lastProcessedIndex; }},
+        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).logicalList); },
+         setLogicalList, nullptr},
+        {FieldKind::Index, nullptr, nullptr,
+         [](PyObject* self) { return &finderState(self).nextChangeIndex; }},
+        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).scopesSeen); },
+         setScopesSeen, nullptr},
+    },
+};
+
+const PickledClass kScopeBodyCache = {
+    scopeBodyCacheType,
+    0xa66c71f,
+    "Incompatible checksums (%zd vs 0xa66c71f = (__fDestroyed, __fSignalCatchers, _fLogicalList, "
+    "_fScopeBodyCache, _fScopeDefCache))",
+    &Names::unpickleScopeBodyCache,
+    5,
+    {
+        kDestroyed,
+        kSignalCatchers,
+        {FieldKind::Object, [](PyObject* self) { return orNone(bodyCacheState(self).logicalList); },
+         setBodyCacheLogicalList, nullptr},
+        {FieldKind::Object, [](PyObject* self) { return orNone(bodyCacheState(self).scopeBodyCache); },
+         [](PyObject* self, PyObject* v) { setBodyCacheDict(&bodyCacheState(self).scopeBodyCache, v); },
+         nullptr},
+        {FieldKind::Object, [](PyObject* self) { return orNone(bodyCacheState(self).scopeDefCache); },
+         [](PyObject* self, PyObject* v) { setBodyCacheDict(&bodyCacheState(self).scopeDefCache, v); },
+         nullptr},
+    },
+};
+
+// Our methods can be reached unbound through the class dict; the fields are
+// only there on instances of the class.
+void requireInstance(const PickledClass& c, PyObject* self, const char* method) {
+    PyTypeObject* type = c.type();
+    if (PyObject_TypeCheck(self, type)) return;
+    PyErr_Format(PyExc_TypeError, "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
+                 method, type->tp_name, Py_TYPE(self)->tp_name);
+    py::fail();
+}
+
+// --- Reduce -------------------------------------------------------------------
+
+// getattr(self, '__dict__', None)
+py::Ref instanceDict(PyObject* self) {
+    PyObject* d = PyObject_GetAttr(self, gNames.dict);
+    if (d != nullptr) return py::Ref::steal(d);
+    if (!PyErr_ExceptionMatches(PyExc_AttributeError)) py::fail();
+    PyErr_Clear();
+    return py::Ref::none();
+}
+
+py::Ref reduce(const PickledClass& c, PyObject* self) {
+    requireInstance(c, self, "__reduce__");
+    py::Ref fields[kMaxFields];
+    bool anyObjectSet = false;
+    for (int i = 0; i < c.fieldCount; ++i) {
+        const Field& f = c.fields[i];
+        switch (f.kind) {
+        case FieldKind::Destroyed:
+            fields[i] = py::Ref::own(base(self)->fDestroyed ? Py_True : Py_False);
+            break;
+        case FieldKind::Object:
+            fields[i] = py::Ref::own(f.read(self));
+            anyObjectSet = anyObjectSet || !fields[i].isNone();
+            break;
+        case FieldKind::Index:
+            fields[i] = py::check(PyInt_FromSsize_t(*f.index(self)));
+            break;
+        }
+    }
+    py::Ref dict = instanceDict(self);
+    const Py_ssize_t size = c.fieldCount + (dict.isNone() ? 0 : 1);
+    py::Ref state = py::check(PyTuple_New(size));
+    for (int i = 0; i < c.fieldCount; ++i) PyTuple_SET_ITEM(state.get(), i, fields[i].release());
+    if (!dict.isNone()) PyTuple_SET_ITEM(state.get(), c.fieldCount, dict.release());
+    const bool setstateForm = size > c.fieldCount || anyObjectSet;
+
+    py::Ref rebuild = py::Ref::own(lookupGlobal(gNames.*c.rebuildName));
+    py::Ref checksum = py::check(PyInt_FromLong(c.checksum));
+    PyObject* type = reinterpret_cast<PyObject*>(Py_TYPE(self));
+    if (setstateForm) {
+        py::Ref args = py::check(PyTuple_Pack(3, type, checksum.get(), Py_None));
+        return py::check(PyTuple_Pack(3, rebuild.get(), args.get(), state.get()));
+    }
+    py::Ref args = py::check(PyTuple_Pack(3, type, checksum.get(), state.get()));
+    return py::check(PyTuple_Pack(2, rebuild.get(), args.get()));
+}
+
+// --- Apply state --------------------------------------------------------------
+
+// Fields are assigned one at a time as they are read: a failure part way
+// leaves the earlier ones assigned.
+void applyState(const PickledClass& c, PyObject* self, PyObject* state) {
+    if (state == Py_None) raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
+    py::Ref keep = py::Ref::own(state);
+    const Py_ssize_t size = PyTuple_GET_SIZE(state);
+    for (int i = 0; i < c.fieldCount; ++i) {
+        if (i >= size) raise(PyExc_IndexError, "tuple index out of range");
+        PyObject* item = PyTuple_GET_ITEM(state, i);
+        const Field& f = c.fields[i];
+        switch (f.kind) {
+        case FieldKind::Destroyed: base(self)->fDestroyed = py::truth(item) ? 1 : 0; break;
+        case FieldKind::Object: f.store(self, item); break;
+        case FieldKind::Index: *f.index(self) = py::asIndex(item); break;
+        }
+    }
+    if (size > c.fieldCount && PyObject_HasAttr(self, gNames.dict)) {
+        py::Ref dict = py::check(PyObject_GetAttr(self, gNames.dict));
+        py::Ref result = py::check(
+            PyObject_CallMethodObjArgs(dict.get(), gNames.update, PyTuple_GET_ITEM(state, c.fieldCount), nullptr));
+    }
+}
+
+void setState(const PickledClass& c, PyObject* self, PyObject* state) {
+    requireInstance(c, self, "__setstate__");
+    if (state != Py_None && !PyTuple_CheckExact(state)) raiseExpectedType("tuple", state);
+    applyState(c, self, state);
+}
+
+// --- Rebuild ------------------------------------------------------------------
+
+py::Ref rebuild(const PickledClass& c, PyObject* type, PyObject* checksumArg, PyObject* state) {
+    const Py_ssize_t checksum = py::asIndex(checksumArg);
+    if (checksum != c.checksum) {
+        py::Ref pickle = py::check(PyImport_ImportModule("pickle"));
+        py::Ref pickleError = py::check(PyObject_GetAttrString(pickle.get(), "PickleError"));
+        py::Ref message = py::check(PyString_FromFormat(c.checksumMessage, checksum));
+        PyErr_SetObject(pickleError.get(), message.get());
+        py::fail();
+    }
+    py::Ref result = py::check(PyObject_CallMethod(reinterpret_cast<PyObject*>(c.type()),
+                                                   const_cast<char*>("__new__"), const_cast<char*>("(O)"),
+                                                   type));
+    if (state != Py_None) {
+        if (!PyTuple_CheckExact(state)) raiseExpectedType("tuple", state);
+        applyState(c, result.get(), state);
+    }
+    return result;
+}
+
+// --- Python-visible functions -------------------------------------------------
+
+template <const PickledClass& C>
+PyObject* m_reduce(PyObject* self, PyObject* const*) {
+    return reduce(C, self).release();
+}
+
+template <const PickledClass& C>
+PyObject* m_setstate(PyObject* self, PyObject* const* a) {
+    setState(C, self, a[0]);
+    return py::Ref::none().release();
+}
+
+template <const PickledClass& C>
+PyObject* f_unpickle(PyObject*, PyObject* const* a) {
+    return rebuild(C, a[0], a[1], a[2]).release();
+}
+
+struct ClassFunctions {
+    const PickledClass& pickled;
+    FunctionSpec reduce;
+    FunctionSpec setstate;
+    FunctionSpec unpickle;
+};
+
+constexpr Param kStateParam{"__pyx_state", ArgCheck::Any};
+#define SBC_UNPICKLE_PARAMS \
+    {{"__pyx_type", ArgCheck::Any}, {"__pyx_checksum", ArgCheck::Any}, kStateParam}
+
+const ClassFunctions kScopeBodyCacheFunctions = {
+    kScopeBodyCache,
+    {"__reduce__", nullptr, m_reduce<kScopeBodyCache>, 0, 0, {}},
+    {"__setstate__", nullptr, m_setstate<kScopeBodyCache>, 1, 1, {kStateParam}},
+    {"__pyx_unpickle_CScopeBodyCache", nullptr, f_unpickle<kScopeBodyCache>, 3, 3, SBC_UNPICKLE_PARAMS},
+};
+
+const ClassFunctions kChangeFinderFunctions = {
+    kChangeFinder,
+    {"__reduce__", nullptr, m_reduce<kChangeFinder>, 0, 0, {}},
+    {"__setstate__", nullptr, m_setstate<kChangeFinder>, 1, 1, {kStateParam}},
+    {"__pyx_unpickle_CChangeFinder", nullptr, f_unpickle<kChangeFinder>, 3, 3, SBC_UNPICKLE_PARAMS},
+};
+#undef SBC_UNPICKLE_PARAMS
+
+const ClassFunctions& functionsFor(PyTypeObject* type) {
+    return type == scopeBodyCacheType() ? kScopeBodyCacheFunctions : kChangeFinderFunctions;
+}
+
+// type.<name> as found through the class, compared by identity with object's.
+bool inheritsFromObject(PyTypeObject* type, const char* name) {
+    py::Ref own = py::check(PyObject_GetAttrString(reinterpret_cast<PyObject*>(type), name));
+    py::Ref object = py::check(PyObject_GetAttrString(reinterpret_cast<PyObject*>(&PyBaseObject_Type), name));
+    return own.get() == object.get();
+}
+
+void install(PyTypeObject* type) {
+    PyObject* typeObject = reinterpret_cast<PyObject*>(type);
+    // A class with hooks of its own keeps them.
+    if (PyObject_HasAttrString(typeObject, "__getstate__")) return;
+    if (!inheritsFromObject(type, "__reduce_ex__") || !inheritsFromObject(type, "__reduce__")) return;
+    const ClassFunctions& f = functionsFor(type);
+    py::Ref reduceMethod = newMethod(f.reduce, type, kModule);
+    py::checkStatus(PyDict_SetItemString(type->tp_dict, "__reduce__", reduceMethod.get()));
+    py::Ref setstateMethod = newMethod(f.setstate, type, kModule);
+    py::checkStatus(PyDict_SetItemString(type->tp_dict, "__setstate__", setstateMethod.get()));
+    PyType_Modified(type);
+}
+
+}  // namespace
+
+void installPickling(PyTypeObject* type) {
+    try {
+        install(type);
+        return;
+    } catch (const py::Error&) {
+    } catch (const std::bad_alloc&) {
+    }
+    PyErr_Clear();
+    PyErr_Format(PyExc_RuntimeError, "Unable to initialize pickling for %s", type->tp_name);
+    py::fail();
+}
+
+void bindUnpickleFunctions(PyObject* moduleDict) {
+    for (const ClassFunctions* f : {&kScopeBodyCacheFunctions, &kChangeFinderFunctions}) {
+        py::Ref function = newFunction(f->unpickle, kModule);
+        py::checkStatus(PyDict_SetItemString(moduleDict, f->unpickle.name, function.get()));
+    }
+}
 
 }  // namespace sbc
