@@ -343,7 +343,7 @@ const FunctionSpec kMethods[] = {
     {"_FindScopeDef",
      " Finds the scope def for the name without using the _fScopeDefCache\n"
      "    for the name (this is used to find the value to put in the cache).\n"
-     "    Raises KeyError if scope isn't found",
+     "    Raises KeyError if scope isn't found ",
      m_FindScopeDef, 1, 1, {kScopeName}},
     {"_FindBodyOfScopeDef", nullptr, m_FindBodyOfScopeDef, 1, 1, {{"scope_def", ArgCheck::Any}}},
 };

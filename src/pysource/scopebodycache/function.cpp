@@ -14,6 +14,7 @@ struct FunctionObject {
     PyObject* qualname;  // str
     PyObject* module;    // str
     PyObject* doc;       // str or None
+    PyTypeObject* owner; // the class of a method, else nullptr
     bool isMethod;
 };
 
@@ -151,6 +152,13 @@ PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
                 py::fail();
             }
             self = PyTuple_GET_ITEM(args, 0);
+            // Taken from the class dict, a method can be handed anything.
+            if (!PyObject_TypeCheck(self, f->owner)) {
+                PyErr_Format(PyExc_TypeError,
+                             "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
+                             PyString_AS_STRING(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
+                py::fail();
+            }
             rest = py::check(PyTuple_GetSlice(args, 1, PyTuple_GET_SIZE(args)));
             args = rest.get();
         }
@@ -176,6 +184,7 @@ void function_dealloc(PyObject* op) {
     Py_XDECREF(f->qualname);
     Py_XDECREF(f->module);
     Py_XDECREF(f->doc);
+    Py_XDECREF(reinterpret_cast<PyObject*>(f->owner));
     Py_TYPE(op)->tp_free(op);
 }
 
@@ -205,11 +214,14 @@ PyMemberDef function_members[] = {
 };
 
 py::Ref makeFunction(const FunctionSpec& spec, const char* qualname, const char* module,
-                     bool isMethod) {
+                     PyTypeObject* owner) {
+    const bool isMethod = owner != nullptr;
     py::Ref op = py::check(PyType_GenericAlloc(&FunctionType, 0));
     auto* f = reinterpret_cast<FunctionObject*>(op.get());
     f->spec = &spec;
     f->isMethod = isMethod;
+    f->owner = owner;
+    Py_XINCREF(owner);
     f->name = py::check(PyString_InternFromString(spec.name)).release();
     f->qualname = py::check(PyString_FromString(qualname)).release();
     f->module = py::check(PyString_InternFromString(module)).release();
@@ -233,14 +245,14 @@ void readyFunctionType() {
 }
 
 py::Ref newFunction(const FunctionSpec& spec, const char* module) {
-    return makeFunction(spec, spec.name, module, false);
+    return makeFunction(spec, spec.name, module, nullptr);
 }
 
 py::Ref newMethod(const FunctionSpec& spec, PyTypeObject* owner, const char* module) {
     const char* dot = std::strrchr(owner->tp_name, '.');
     py::Ref qual = py::check(
         PyString_FromFormat("%s.%s", dot ? dot + 1 : owner->tp_name, spec.name));
-    return makeFunction(spec, PyString_AS_STRING(qual.get()), module, true);
+    return makeFunction(spec, PyString_AS_STRING(qual.get()), module, owner);
 }
 
 bool isBoundFormOf(PyObject* callable, PyObject* function) {
