@@ -2,7 +2,7 @@
 carried, and that every edit leaves the names a fresh whole-file pass gives."""
 import unittest
 
-from finder_support import (CChangeFinder, apply_edit, code, comment, deff, fresh_names,
+from finder_support import (CChangeFinder, apply_edit, code, finder_fields, fresh_names,
                             names, read_named, run_python, scope_names, whole_pass)
 from pysource.logicals import ReadLogicals
 
@@ -67,6 +67,54 @@ class VisitingOrder(unittest.TestCase):
         lst, finder, result = edited(source, new, Spy)
         self.assertEqual(finder.runs, [2])
         self.assertEqual(names(lst), fresh_names(new))
+
+
+class IndicesWhileVisiting(unittest.TestCase):
+
+    def test_next_change_and_last_processed_indices(self):
+        snapshots = []
+
+        class Watch(CChangeFinder):
+            def _ProcessAddedLogicals(self, added_list, indicies_to_check):
+                CChangeFinder._ProcessAddedLogicals(self, added_list, indicies_to_check)
+                snapshots.append(('end', finder_fields(self)))
+
+            def _FindScopeNameContainingLogical(self, i):
+                snapshots.append((i, finder_fields(self)))
+                return CChangeFinder._FindScopeNameContainingLogical(self, i)
+
+        lst = read_named("a = 1\nb = 2\nc = 3\nd = 4\ne = 5\n")
+        finder = Watch(lst)
+        new = ReadLogicals("a = 1\nb = 20\nc = 3\nd = 40\ne = 5\n")
+        removed = [lst[1], lst[3]]
+        lst[1], lst[3] = new[1], new[3]
+        finder.FindChanges([new[1], new[3]], removed)
+        visits = [(i, f['next_change_index'], f['last_processed_index'])
+                  for i, f in snapshots if i != 'end']
+        # 1 and 3 are visited (each also mapped from a removed logical);
+        # the scans after them look at 2 and 4 and stop there.
+        self.assertEqual(visits, [(1, 3, -1), (2, 3, -1), (3, 5, 1), (4, 5, 1)])
+        end = snapshots[-1][1]
+        self.assertEqual((end['next_change_index'], end['last_processed_index']), (5, 3))
+        self.assertEqual(finder_fields(finder)['next_change_index'], -1)
+
+    def test_dedented_run_sets_last_processed_to_the_end_of_the_run(self):
+        seen = []
+
+        class Watch(CChangeFinder):
+            def _FindScopeNameContainingLogical(self, i):
+                seen.append((i, finder_fields(self)['last_processed_index']))
+                return CChangeFinder._FindScopeNameContainingLogical(self, i)
+
+        lst = read_named("def f():\n    a = 1\n# c1\n# c2\n# c3\nz = 2\n")
+        finder = Watch(lst)
+        new = ReadLogicals("def f():\n    a = 1\n# c1x\n# c2\n# c3\nz = 2\n")
+        removed = [lst[2]]
+        lst[2] = new[2]
+        finder.FindChanges([new[2]], removed)
+        # The run 2..4 is placed from the code line at 5; then 5 is visited
+        # with the run marked as processed.
+        self.assertEqual(seen, [(5, -1), (5, 4)])
 
 
 class ForwardScan(unittest.TestCase):

@@ -1,7 +1,7 @@
 """The whole-list pass: names of a freshly read file, and the change sets."""
 import unittest
 
-from finder_support import (CChangeFinder, blank, code, comment, deff, klass, logical,
+from finder_support import (CChangeFinder, blank, code, comment, deff, finder_fields, logical,
                             names, read_named, run_python, scope_names, whole_pass)
 from pysource.logicals import ReadLogicals
 
@@ -70,6 +70,23 @@ class RepeatedDefinitions(unittest.TestCase):
 
     def test_empty_list(self):
         self.assertEqual(whole_pass([])[1], (set(['']), set(), set()))
+
+    def test_scopes_seen_table_after_the_pass(self):
+        tables = []
+
+        class Watch(CChangeFinder):
+            def _FindChangesEntireListAdded(self):
+                CChangeFinder._FindChangesEntireListAdded(self)
+                tables.append(finder_fields(self))
+
+        lst = ReadLogicals("def f(): pass\ndef f(): pass\nclass C:\n    def f(self): pass\n")
+        finder, result = whole_pass(lst, Watch)
+        fields = tables[0]
+        self.assertEqual(fields['scopes_seen'], {'f': 1, 'C': 0, 'C#0.f': 0})
+        # The pass counts without moving the indices.
+        self.assertEqual((fields['end_index_for_scopes_seen'], fields['next_change_index'],
+                          fields['last_processed_index']), (0, -1, -1))
+        self.assertEqual(finder_fields(finder)['scopes_seen'], None)
 
     def test_second_whole_pass_gives_the_same_names(self):
         source = ("def f():\n    pass\ndef f():\n    x = 1\n"
