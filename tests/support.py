@@ -74,3 +74,38 @@ def RemovedModuleGlobal(module, name):
         yield
     finally:
         module.__dict__[name] = saved
+
+
+def _Key(l):
+    return (l.fTokens, l.fIndent, l.fKind)
+
+
+def Edit(lst, new_source):
+    """Turns `lst` in place into the logicals of `new_source`, as an editor would.
+
+    Keeps the logicals of the unchanged head and tail (the tail's line
+    numbers follow the new text) and replaces the middle. Returns
+    (added, removed) for FindChanges.
+    """
+    new = Read(new_source)
+    limit = min(len(lst), len(new))
+    head = 0
+    while head < limit and _Key(lst[head]) == _Key(new[head]):
+        head += 1
+    tail = 0
+    while tail < limit - head and _Key(lst[-1 - tail]) == _Key(new[-1 - tail]):
+        tail += 1
+    for k in range(1, tail + 1):
+        lst[-k].fLineno = new[-k].fLineno
+    removed = lst[head:len(lst) - tail]
+    added = new[head:len(new) - tail]
+    lst[head:len(lst) - tail] = added
+    return added, removed
+
+
+def WholeListNames(source):
+    """The names a fresh finder gives the logicals of `source`."""
+    from pysource.scopebodycache import CChangeFinder
+    lst = Read(source)
+    CChangeFinder(lst).FindChanges(lst, [])
+    return Names(lst)
