@@ -9,6 +9,7 @@
 
 #include "pysource/contracts/accessors.hpp"
 #include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/destroyable_subclass.hpp"
 #include "pysource/scopebodycache/function.hpp"
 #include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
@@ -205,62 +206,8 @@ void clear(PyObject* self, PyObject* scopeNames) {
 
 // --- Type slots -------------------------------------------------------------
 
-// As for CChangeFinder: a heap-type base's subtype_* slots would start again
-// from the instance's type and come back here.
-bool baseSlotsChain() noexcept { return !(gDestroyableType->tp_flags & Py_TPFLAGS_HEAPTYPE); }
-
-DestroyableObject* base(PyObject* self) noexcept { return reinterpret_cast<DestroyableObject*>(self); }
-
-PyObject* cache_new(PyTypeObject* type, PyObject* args, PyObject* kwargs) {
-    PyObject* self = gDestroyableType->tp_new(type, args, kwargs);
-    if (self == nullptr) return nullptr;
-    BodyCacheState& s = bodyCacheState(self);
-    for (PyObject** field : {&s.logicalList, &s.scopeBodyCache, &s.scopeDefCache}) {
-        Py_INCREF(Py_None);
-        *field = Py_None;
-    }
-    return self;
-}
-
-int cache_traverse(PyObject* self, visitproc visit, void* arg) {
-    BodyCacheState& s = bodyCacheState(self);
-    Py_VISIT(s.logicalList);
-    Py_VISIT(s.scopeBodyCache);
-    Py_VISIT(s.scopeDefCache);
-    if (baseSlotsChain()) {
-        if (gDestroyableType->tp_traverse) return gDestroyableType->tp_traverse(self, visit, arg);
-        return 0;
-    }
-    Py_VISIT(base(self)->fSignalCatchers);
-    return 0;
-}
-
-int cache_clear(PyObject* self) {
-    BodyCacheState& s = bodyCacheState(self);
-    for (PyObject** field : {&s.logicalList, &s.scopeBodyCache, &s.scopeDefCache}) {
-        py::storeSlot(field, Py_None);
-    }
-    if (baseSlotsChain()) {
-        if (gDestroyableType->tp_clear) return gDestroyableType->tp_clear(self);
-        return 0;
-    }
-    py::storeSlot(&base(self)->fSignalCatchers, Py_None);
-    return 0;
-}
-
-void cache_dealloc(PyObject* self) {
-    PyObject_GC_UnTrack(self);
-    BodyCacheState& s = bodyCacheState(self);
-    Py_CLEAR(s.logicalList);
-    Py_CLEAR(s.scopeBodyCache);
-    Py_CLEAR(s.scopeDefCache);
-    if (baseSlotsChain()) {
-        gDestroyableType->tp_dealloc(self);
-        return;
-    }
-    Py_CLEAR(base(self)->fSignalCatchers);
-    Py_TYPE(self)->tp_free(self);
-}
+using Slots = DestroyableSubclass<BodyCacheState, &gBodyCacheStateOffset, &BodyCacheState::logicalList,
+                                  &BodyCacheState::scopeBodyCache, &BodyCacheState::scopeDefCache>;
 
 const FunctionSpec kInitSpec = {"__init__", nullptr, nullptr, 1, 1, {{"logical_list", ArgCheck::Any}},
                                 true};
@@ -269,9 +216,7 @@ int cache_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
         PyObject* argv[kMaxParams];
         parseArgs(kInitSpec, args, kwargs, argv);
-        py::Ref result = py::check(PyObject_CallMethod(reinterpret_cast<PyObject*>(gDestroyableType),
-                                                       const_cast<char*>("__init__"),
-                                                       const_cast<char*>("(O)"), self));
+        callBaseInit(self);
         setBodyCacheLogicalList(self, argv[0]);
         BodyCacheState& s = bodyCacheState(self);
         py::Ref bodies = py::check(PyDict_New());
@@ -365,18 +310,9 @@ void setBodyCacheDict(PyObject** field, PyObject* value) {
 void readyScopeBodyCacheType() {
     gDot = py::check(PyString_InternFromString(".")).release();
     gJoin = py::check(PyString_InternFromString("join")).release();
-    // Our fields go after the base's instance, whatever its size turned out to be.
-    gBodyCacheStateOffset = (gDestroyableType->tp_basicsize + alignof(BodyCacheState) - 1) /
-                            alignof(BodyCacheState) * alignof(BodyCacheState);
     BodyCacheType.tp_name = "pysource.scopebodycache.CScopeBodyCache";
-    BodyCacheType.tp_basicsize = gBodyCacheStateOffset + sizeof(BodyCacheState);
-    BodyCacheType.tp_flags = Py_TPFLAGS_DEFAULT | Py_TPFLAGS_BASETYPE | Py_TPFLAGS_HAVE_GC;
-    BodyCacheType.tp_base = gDestroyableType;
-    BodyCacheType.tp_new = cache_new;
+    Slots::fillType(BodyCacheType);
     BodyCacheType.tp_init = cache_init;
-    BodyCacheType.tp_dealloc = cache_dealloc;
-    BodyCacheType.tp_traverse = cache_traverse;
-    BodyCacheType.tp_clear = cache_clear;
     BodyCacheType.tp_getset = cache_getset;
     py::checkStatus(PyType_Ready(&BodyCacheType));
 }

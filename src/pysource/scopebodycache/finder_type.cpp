@@ -1,6 +1,6 @@
 // CPython glue of CChangeFinder: the type object, its slots, the method
 // table and the routing of overridable steps. The rules live in finder_*.cpp.
-#include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/destroyable_subclass.hpp"
 #include "pysource/scopebodycache/dispatch.hpp"
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/function.hpp"
@@ -53,74 +53,9 @@ const char kSetNamesDoc[] =
     "    list.  Succeeds if given a scope_name or if all logicals prior to this one\n"
     "    have already been updated ";
 
-// A heap-type base (a Python class given in place of CDestroyable) has
-// subtype_* slots that start again from the instance's type; chaining to
-// them would come back here.
-bool baseSlotsChain() noexcept { return !(gDestroyableType->tp_flags & Py_TPFLAGS_HEAPTYPE); }
-
-contracts::DestroyableObject* base(PyObject* self) noexcept {
-    return reinterpret_cast<contracts::DestroyableObject*>(self);
-}
-
-PyObject* finder_new(PyTypeObject* type, PyObject* args, PyObject* kwargs) {
-    PyObject* self = gDestroyableType->tp_new(type, args, kwargs);
-    if (self == nullptr) return nullptr;
-    FinderState& s = finderState(self);
-    for (PyObject** field : {&s.logicalList, &s.classChanges, &s.functionChanges, &s.contentsChanges,
-                             &s.scopesSeen}) {
-        Py_INCREF(Py_None);
-        *field = Py_None;
-    }
-    s.endIndexForScopesSeen = 0;
-    s.nextChangeIndex = 0;
-    s.lastProcessedIndex = 0;
-    return self;
-}
-
-int finder_traverse(PyObject* self, visitproc visit, void* arg) {
-    FinderState& s = finderState(self);
-    Py_VISIT(s.logicalList);
-    Py_VISIT(s.classChanges);
-    Py_VISIT(s.functionChanges);
-    Py_VISIT(s.contentsChanges);
-    Py_VISIT(s.scopesSeen);
-    if (baseSlotsChain()) {
-        if (gDestroyableType->tp_traverse) return gDestroyableType->tp_traverse(self, visit, arg);
-        return 0;
-    }
-    Py_VISIT(base(self)->fSignalCatchers);
-    return 0;
-}
-
-int finder_clear(PyObject* self) {
-    FinderState& s = finderState(self);
-    for (PyObject** field : {&s.logicalList, &s.classChanges, &s.functionChanges, &s.contentsChanges,
-                             &s.scopesSeen}) {
-        py::storeSlot(field, Py_None);
-    }
-    if (baseSlotsChain()) {
-        if (gDestroyableType->tp_clear) return gDestroyableType->tp_clear(self);
-        return 0;
-    }
-    py::storeSlot(&base(self)->fSignalCatchers, Py_None);
-    return 0;
-}
-
-void finder_dealloc(PyObject* self) {
-    PyObject_GC_UnTrack(self);
-    FinderState& s = finderState(self);
-    Py_CLEAR(s.logicalList);
-    Py_CLEAR(s.classChanges);
-    Py_CLEAR(s.functionChanges);
-    Py_CLEAR(s.contentsChanges);
-    Py_CLEAR(s.scopesSeen);
-    if (baseSlotsChain()) {
-        gDestroyableType->tp_dealloc(self);
-        return;
-    }
-    Py_CLEAR(base(self)->fSignalCatchers);
-    Py_TYPE(self)->tp_free(self);
-}
+using Slots = DestroyableSubclass<FinderState, &gFinderStateOffset, &FinderState::logicalList,
+                                  &FinderState::classChanges, &FinderState::functionChanges,
+                                  &FinderState::contentsChanges, &FinderState::scopesSeen>;
 
 const FunctionSpec kInitSpec = {"__init__", nullptr, nullptr, 1, 1, {{"logical_list", ArgCheck::Any}},
                                 true};
@@ -129,9 +64,7 @@ int finder_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
         PyObject* argv[kMaxParams];
         parseArgs(kInitSpec, args, kwargs, argv);
-        py::Ref result = py::check(PyObject_CallMethod(reinterpret_cast<PyObject*>(gDestroyableType),
-                                                       const_cast<char*>("__init__"),
-                                                       const_cast<char*>("(O)"), self));
+        callBaseInit(self);
         setLogicalList(self, argv[0]);
         route::Clear(self);
         return 0;
@@ -293,19 +226,10 @@ const MethodEntry kMethods[] = {
 PyTypeObject* changeFinderType() noexcept { return &FinderType; }
 
 void readyChangeFinderType() {
-    // Our fields go after the base's instance, whatever its size turned out to be.
-    gFinderStateOffset = (gDestroyableType->tp_basicsize + alignof(FinderState) - 1) /
-                         alignof(FinderState) * alignof(FinderState);
     FinderType.tp_name = "pysource.scopebodycache.CChangeFinder";
-    FinderType.tp_basicsize = gFinderStateOffset + sizeof(FinderState);
-    FinderType.tp_flags = Py_TPFLAGS_DEFAULT | Py_TPFLAGS_BASETYPE | Py_TPFLAGS_HAVE_GC;
+    Slots::fillType(FinderType);
     FinderType.tp_doc = kClassDoc;
-    FinderType.tp_base = gDestroyableType;
-    FinderType.tp_new = finder_new;
     FinderType.tp_init = finder_init;
-    FinderType.tp_dealloc = finder_dealloc;
-    FinderType.tp_traverse = finder_traverse;
-    FinderType.tp_clear = finder_clear;
     FinderType.tp_getset = finder_getset;
     py::checkStatus(PyType_Ready(&FinderType));
 }

@@ -1,0 +1,94 @@
+// Slots shared by the two classes built on tallowkit.destroyable.CDestroyable:
+// their object fields live after the base's instance, whatever size that
+// turned out to be at import, and take part in garbage collection.
+#pragma once
+
+#include "common/pyref.hpp"
+#include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/siblings.hpp"
+
+namespace sbc {
+
+template <class State, Py_ssize_t* Offset, PyObject* State::*... Fields>
+struct DestroyableSubclass {
+    static State& state(PyObject* self) noexcept {
+        return *reinterpret_cast<State*>(reinterpret_cast<char*>(self) + *Offset);
+    }
+
+    // Places the fields after the base; returns the instance size.
+    static Py_ssize_t layout() noexcept {
+        const Py_ssize_t align = alignof(State);
+        *Offset = (gDestroyableType->tp_basicsize + align - 1) / align * align;
+        return *Offset + static_cast<Py_ssize_t>(sizeof(State));
+    }
+
+    // The base allocates zeroed memory: indices start at 0, objects at None.
+    static PyObject* tp_new(PyTypeObject* type, PyObject* args, PyObject* kwargs) {
+        PyObject* self = gDestroyableType->tp_new(type, args, kwargs);
+        if (self == nullptr) return nullptr;
+        State& s = state(self);
+        ((Py_INCREF(Py_None), s.*Fields = Py_None), ...);
+        return self;
+    }
+
+    static int tp_traverse(PyObject* self, visitproc visit, void* arg) {
+        State& s = state(self);
+        for (PyObject* field : {s.*Fields...}) Py_VISIT(field);
+        if (baseSlotsChain()) {
+            return gDestroyableType->tp_traverse ? gDestroyableType->tp_traverse(self, visit, arg) : 0;
+        }
+        Py_VISIT(base(self)->fSignalCatchers);
+        return 0;
+    }
+
+    static int tp_clear(PyObject* self) {
+        State& s = state(self);
+        (py::storeSlot(&(s.*Fields), Py_None), ...);
+        if (baseSlotsChain()) return gDestroyableType->tp_clear ? gDestroyableType->tp_clear(self) : 0;
+        py::storeSlot(&base(self)->fSignalCatchers, Py_None);
+        return 0;
+    }
+
+    static void tp_dealloc(PyObject* self) {
+        PyObject_GC_UnTrack(self);
+        State& s = state(self);
+        (clearField(&(s.*Fields)), ...);
+        if (baseSlotsChain()) {
+            gDestroyableType->tp_dealloc(self);
+            return;
+        }
+        Py_CLEAR(base(self)->fSignalCatchers);
+        Py_TYPE(self)->tp_free(self);
+    }
+
+    static void fillType(PyTypeObject& type) noexcept {
+        type.tp_basicsize = layout();
+        type.tp_flags = Py_TPFLAGS_DEFAULT | Py_TPFLAGS_BASETYPE | Py_TPFLAGS_HAVE_GC;
+        type.tp_base = gDestroyableType;
+        type.tp_new = tp_new;
+        type.tp_dealloc = tp_dealloc;
+        type.tp_traverse = tp_traverse;
+        type.tp_clear = tp_clear;
+    }
+
+private:
+    static void clearField(PyObject** field) noexcept { Py_CLEAR(*field); }
+
+    // A heap-type base (a Python class given in place of CDestroyable) has
+    // subtype_* slots that start again from the instance's type; chaining
+    // to them would come back here.
+    static bool baseSlotsChain() noexcept {
+        return !(gDestroyableType->tp_flags & Py_TPFLAGS_HEAPTYPE);
+    }
+    static contracts::DestroyableObject* base(PyObject* self) noexcept {
+        return reinterpret_cast<contracts::DestroyableObject*>(self);
+    }
+};
+
+// CDestroyable.__init__(self), looked up as Python code would.
+inline void callBaseInit(PyObject* self) {
+    py::check(PyObject_CallMethod(reinterpret_cast<PyObject*>(gDestroyableType),
+                                  const_cast<char*>("__init__"), const_cast<char*>("(O)"), self));
+}
+
+}  // namespace sbc
