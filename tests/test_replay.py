@@ -237,6 +237,17 @@ class OracleTest(unittest.TestCase):
                                             finder_class=LazyFinder)
         self.assertEqual([s.new_lines for s in small_splices], [['def f():']])
 
+    def testShrinkThinsTheEditedLines(self):
+        text = ''.join('x%d = %d\n' % (i, i) for i in range(10))
+        rewrite = Splice(3, 4, ['a = 1', 'def f():', 'b = 2', 'c = 3'])
+        insert = Splice(3, 0, ['a = 1', 'def f():', 'b = 2'])
+        for splice in (rewrite, insert):
+            small, small_splices, _ = replay.Shrink(text, [splice], 'names', False,
+                                                    finder_class=LazyFinder)
+            self.assertEqual([s.new_lines for s in small_splices], [['def f():']])
+            got = replay.RunScenario(small, small_splices, finder_class=LazyFinder)
+            self.assertEqual(got[0].problems.invariant, 'names')
+
     def testReproducerRebuildsTheNewText(self):
         text = 'class A:\n    def f(self):\n        x = 1\n    # c\n\ny = 2\n' * 3
         splices = [Splice(1, 0, ['    def f(self):']), Splice(9, 0, ['z = 1'])]
@@ -321,6 +332,15 @@ kScenarios = [
     ('module_function_indented_into_class',
      'class A:\n    x = 1\ndef f():\n    y = 2\nz = 3\n',
      'class A:\n    x = 1\n    def f():\n        y = 2\nz = 3\n'),
+    ('header_typed_without_a_name_over_a_nested_def',
+     'if True:\n    def g():\n        pass\n',
+     'def\n    def g():\n        pass\n'),
+    ('dedented_header_takes_a_later_line_past_an_unchanged_one',
+     '    def t(self):\n        a = 1\n        b = 2\n    c = 3\n',
+     'def t(self):\n    a = 1\n        b = 2\n    c = 3\n'),
+    ('indented_header_drops_a_later_line_past_an_unchanged_one',
+     'def s(obj):\n    a = 1\n        b = 2\n    c = 3\n',
+     '    def s(obj):\n        a = 1\n        b = 2\n    c = 3\n'),
     ('whitespace_only_line_at_end_of_body',
      'def f():\n    x = 1\ny = 2\n',
      'def f():\n    x = 1\n    \ny = 2\n'),

@@ -179,7 +179,9 @@ py::Ref findBodyOfScopeDef(PyObject* self, PyObject* scopeDef) {
             nestedIndent = -1;
         }
         py::checkStatus(PyList_Append(body.get(), logical));
-        if (isScopeStart(l)) nestedIndent = indent;
+        // A class/def line without a name opens no scope, as the change
+        // finder names it: the lines under it stay in this body.
+        if (isScopeStart(l) && localScopeDefined(l) != nullptr) nestedIndent = indent;
     }
     return body;
 }

@@ -12,6 +12,9 @@
 // - _fScopesSeen maps "<containing scope>.<bare name>" to the index of the
 //   last definition of that key before _fEndIndexForScopesSeen; the end only
 //   moves forward within one call.
+// - A forward scan stops at an unchanged code line only when that line is
+//   indented no deeper than every line the scan changed: a shallower line
+//   further down looks back past deeper unchanged ones to the changed lines.
 // - A comment or blank line gets the scope of the next code line when it is
 //   indented no deeper than that line, else the scope its own look-back
 //   finds; a trailing run with no code after it is placed as if a
@@ -32,7 +35,13 @@ struct FinderState {
     Py_ssize_t endIndexForScopesSeen;
     Py_ssize_t nextChangeIndex;
     Py_ssize_t lastProcessedIndex;
+    // Not a Python-visible field: the least indent among the logicals a
+    // forward scan changed before _fNextChangeIndex cut it short (kNoScanOwed
+    // when none). The next visit carries that scan on.
+    long owedScanIndent;
 };
+
+inline constexpr long kNoScanOwed = 1L << 20;
 
 // Our fields follow whatever instance size the base class has at import.
 extern Py_ssize_t gFinderStateOffset;
@@ -88,7 +97,7 @@ py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i);
 
 // Internal steps, not visible to Python.
 void ProcessNonDedentedComment(PyObject* self, PyObject* logical, Py_ssize_t i);
-void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start);
+void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedIndent);
 void UpdateScopesSeen(PyObject* self, Py_ssize_t end);
 Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logical,
                                                  PyObject* scopeName, bool nameIsBare) noexcept;

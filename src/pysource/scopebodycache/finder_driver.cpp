@@ -50,6 +50,7 @@ void Clear(PyObject* self) {
     s.endIndexForScopesSeen = 0;
     s.nextChangeIndex = -1;
     s.lastProcessedIndex = -1;
+    s.owedScanIndent = kNoScanOwed;
 }
 
 void PrepareForFind(PyObject* self) {
@@ -61,6 +62,7 @@ void PrepareForFind(PyObject* self) {
     s.endIndexForScopesSeen = 0;
     s.nextChangeIndex = -1;
     s.lastProcessedIndex = -1;
+    s.owedScanIndent = kNoScanOwed;
 }
 
 void DestroyImpl(PyObject* self) {

@@ -4,6 +4,8 @@
 #include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
+#include <algorithm>
+
 namespace sbc::finder {
 
 using namespace contracts;
@@ -133,15 +135,22 @@ void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t 
             changed = true;
         }
     }
-    if (!changed) return;
+    // A scan cut short before this index is carried on from here.
+    FinderState& s = finderState(self);
+    const long owed = s.owedScanIndent;
+    s.owedScanIndent = kNoScanOwed;
+    if (!changed) {
+        if (owed < logical->fIndent) ScanForwardForChangedScopes(self, i + 1, owed);
+        return;
+    }
     if (!previousLocal.isNone() && !leafScopeNameHasIndex(previousLocal.get())) {
         previousLocal = py::Ref::none();
     }
     route::LogicalInScopeChanged(self, logicalObj, scope.get(), previous.get(), previousLocal.get());
-    ScanForwardForChangedScopes(self, i + 1);
+    ScanForwardForChangedScopes(self, i + 1, std::min<long>(owed, logical->fIndent));
 }
 
-void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start) {
+void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedIndent) {
     FinderState& s = finderState(self);
     assertThat(s.nextChangeIndex != -1);
     Py_ssize_t k = start;
@@ -149,7 +158,7 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start) {
         py::Ref item = logicalAt(self, k);
         Logical* logical = requireLogical(item.get());
         py::Ref previous = py::Ref::own(scopeName(logical));
-        if (previous.isNone()) return;
+        if (previous.isNone()) break;
         if (isWhitespace(logical)) {
             // Placed with the rest of its run; an unchanged comment says
             // nothing about the code after it, so the scan goes on.
@@ -163,15 +172,23 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start) {
             assertThat(false);
             return;
         }
-        if (py::checkStatus(PyObject_RichCompareBool(scope.get(), previous.get(), Py_EQ))) return;
+        if (py::checkStatus(PyObject_RichCompareBool(scope.get(), previous.get(), Py_EQ))) {
+            if (logical->fIndent <= changedIndent) return;
+            ++k;
+            continue;
+        }
         if (!PyString_CheckExact(scope.get())) raiseExpectedType("str", scope.get());
         // Recorded before the update, while a class/def still carries its
         // old local name, so that its old full name is in the change sets.
         route::LogicalInScopeChanged(self, item.get(), previous.get());
         route::UpdateLogicalScopeName(self, item.get(), k, scope.get());
         route::LogicalInScopeChanged(self, item.get(), scope.get());
+        if (logical->fIndent < changedIndent) changedIndent = logical->fIndent;
         ++k;
     }
+    // Cut short by the next index to visit (or by a logical not named yet):
+    // that visit carries the scan on.
+    if (changedIndent < s.owedScanIndent) s.owedScanIndent = changedIndent;
 }
 
 }  // namespace sbc::finder

@@ -104,7 +104,7 @@ py::Ref UpdateLogicalScopeName(PyObject* self, PyObject* logicalObj, Py_ssize_t 
                                  newLocal.get(), oldLocal ? oldLocal.get() : Py_None, Py_NE)) != 0;
         if (differs) {
             setLocalScopeDefined(logical, newLocal.get());
-            ScanForwardForChangedScopes(self, i + 1);
+            ScanForwardForChangedScopes(self, i + 1, logical->fIndent);
         }
     }
     return py::Ref::own(scopeName);
