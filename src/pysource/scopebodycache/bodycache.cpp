@@ -211,15 +211,9 @@ void clear(PyObject* self, PyObject* scopeNames) {
 using Slots = DestroyableSubclass<BodyCacheState, &gBodyCacheStateOffset, &BodyCacheState::logicalList,
                                   &BodyCacheState::scopeBodyCache, &BodyCacheState::scopeDefCache>;
 
-const FunctionSpec kInitSpec = {"__init__", nullptr, nullptr, 1, 1, {{"logical_list", ArgCheck::Any}},
-                                true};
-
 int cache_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
-        PyObject* argv[kMaxParams];
-        parseArgs(kInitSpec, args, kwargs, argv);
-        callBaseInit(self);
-        setBodyCacheLogicalList(self, argv[0]);
+        setBodyCacheLogicalList(self, initDestroyableSubclass(self, args, kwargs));
         BodyCacheState& s = bodyCacheState(self);
         py::Ref bodies = py::check(PyDict_New());
         py::storeSlot(&s.scopeBodyCache, bodies.get());

@@ -5,6 +5,7 @@
 
 #include "common/pyref.hpp"
 #include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/function.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
 namespace sbc {
@@ -85,10 +86,17 @@ private:
     }
 };
 
-// CDestroyable.__init__(self), looked up as Python code would.
-inline void callBaseInit(PyObject* self) {
+// The first steps of both __init__s: parse the one argument `logical_list`,
+// then run CDestroyable.__init__(self), looked up as Python code would.
+// Returns the argument (borrowed from the call).
+inline PyObject* initDestroyableSubclass(PyObject* self, PyObject* args, PyObject* kwargs) {
+    static const FunctionSpec spec = {"__init__", nullptr, nullptr, 1, 1,
+                                      {{"logical_list", ArgCheck::Any}}, true};
+    PyObject* argv[kMaxParams];
+    parseArgs(spec, args, kwargs, argv);
     py::check(PyObject_CallMethod(reinterpret_cast<PyObject*>(gDestroyableType),
                                   const_cast<char*>("__init__"), const_cast<char*>("(O)"), self));
+    return argv[0];
 }
 
 }  // namespace sbc

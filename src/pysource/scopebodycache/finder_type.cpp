@@ -57,15 +57,9 @@ using Slots = DestroyableSubclass<FinderState, &gFinderStateOffset, &FinderState
                                   &FinderState::classChanges, &FinderState::functionChanges,
                                   &FinderState::contentsChanges, &FinderState::scopesSeen>;
 
-const FunctionSpec kInitSpec = {"__init__", nullptr, nullptr, 1, 1, {{"logical_list", ArgCheck::Any}},
-                                true};
-
 int finder_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
-        PyObject* argv[kMaxParams];
-        parseArgs(kInitSpec, args, kwargs, argv);
-        callBaseInit(self);
-        setLogicalList(self, argv[0]);
+        setLogicalList(self, initDestroyableSubclass(self, args, kwargs));
         route::Clear(self);
         return 0;
     });
