@@ -12,7 +12,11 @@ class MyList(list):
     pass
 
 
-class ArgumentTestCase(unittest.TestCase):
+def TypeMessage(param, expected, got):
+    return "Argument '%s' has incorrect type (expected %s, got %s)" % (param, expected, got)
+
+
+class ArgumentTest(unittest.TestCase):
 
     def setUp(self):
         self.lst = Read('def f():\n    pass\n')
@@ -20,84 +24,75 @@ class ArgumentTestCase(unittest.TestCase):
         self.finder.FindChanges(self.lst, [])
         self.logical = self.lst[0]
 
-    def assertTypeError(self, message, func, *args, **kwargs):
-        with self.assertRaises(TypeError) as cm:
-            func(*args, **kwargs)
-        self.assertEqual(str(cm.exception), message)
-
-
-class CountTest(ArgumentTestCase):
-
-    def testFixedCount(self):
-        f = self.finder
-        for args, given in [((), 0), (([],), 1), (([], [], []), 3)]:
-            self.assertTypeError(
-                'FindChanges() takes exactly 2 positional arguments (%d given)' % given,
-                f.FindChanges, *args)
-        self.assertTypeError(
-            '_PropagateScopeIndexChangeForward() takes exactly 4 positional arguments (5 given)',
-            f._PropagateScopeIndexChangeForward, 'a', 'b', 0, 1, 2)
-        self.assertTypeError('PySet_InplaceOr() takes exactly 2 positional arguments (3 given)',
-                             sbc.PySet_InplaceOr, set(), set(), set())
-
-    def testSingularForACountOfOne(self):
-        self.assertTypeError('__init__() takes exactly 1 positional argument (0 given)',
-                             CChangeFinder)
-        self.assertTypeError('__init__() takes exactly 1 positional argument (2 given)',
-                             CChangeFinder, [], [])
-
-    def testOptionalParameters(self):
-        f = self.finder
-        self.assertTypeError(
-            '_LogicalInScopeChanged() takes at least 2 positional arguments (1 given)',
-            f._LogicalInScopeChanged, self.logical)
-        self.assertTypeError(
-            '_LogicalInScopeChanged() takes at most 4 positional arguments (5 given)',
-            f._LogicalInScopeChanged, self.logical, '', None, None, None)
-
-    def testNoParameters(self):
-        f = self.finder
-        self.assertTypeError('_Clear() takes no arguments (1 given)', f._Clear, 1)
-        self.assertTypeError('_PrepareForFind() takes no arguments (2 given)',
-                             f._PrepareForFind, 1, 2)
-        self.assertTypeError('_destroy_impl() takes no arguments (1 given)', f._destroy_impl, 1)
-        self.assertTypeError('_FindChangesEntireListAdded() takes no arguments (1 given)',
-                             f._FindChangesEntireListAdded, None)
-        self.assertTypeError('GetNowTime() takes no arguments (1 given)', sbc.GetNowTime, 1)
+    def testRefusedArguments(self):
+        f, l = self.finder, self.logical
+        # (function, args, kwargs, exception, message or None)
+        cases = [
+            (f.FindChanges, ([],), {}, TypeError,
+             'FindChanges() takes exactly 2 positional arguments (1 given)'),
+            (f.FindChanges, ([], [], []), {}, TypeError,
+             'FindChanges() takes exactly 2 positional arguments (3 given)'),
+            (sbc.PySet_InplaceOr, (set(), set(), set()), {}, TypeError,
+             'PySet_InplaceOr() takes exactly 2 positional arguments (3 given)'),
+            (CChangeFinder, ([], []), {}, TypeError,
+             '__init__() takes exactly 1 positional argument (2 given)'),
+            (f._LogicalInScopeChanged, (l,), {}, TypeError,
+             '_LogicalInScopeChanged() takes at least 2 positional arguments (1 given)'),
+            (f._LogicalInScopeChanged, (l, '', None, None, None), {}, TypeError,
+             '_LogicalInScopeChanged() takes at most 4 positional arguments (5 given)'),
+            (f._PrepareForFind, (1, 2), {}, TypeError,
+             '_PrepareForFind() takes no arguments (2 given)'),
+            (sbc.GetNowTime, (1,), {}, TypeError, 'GetNowTime() takes no arguments (1 given)'),
+            (f._ProcessRemovedLogicals, ([], []), {}, TypeError,
+             '_ProcessRemovedLogicals() takes exactly one argument (2 given)'),
+            (sbc.GetFullNameForScopeDef, (), {}, TypeError,
+             'GetFullNameForScopeDef() takes exactly one argument (0 given)'),
+            (f._Clear, (), {'x': 1}, TypeError, '_Clear() takes no keyword arguments'),
+            (f._ProcessDedentedComments, (), {'first_comment_i': 0}, TypeError,
+             '_ProcessDedentedComments() takes no keyword arguments'),
+            (sbc.LogicalCheck, (), {'logical': None}, TypeError,
+             'LogicalCheck() takes no keyword arguments'),
+            (f.FindChanges, ([], []), {'bogus': 1}, TypeError,
+             "FindChanges() got an unexpected keyword argument 'bogus'"),
+            (CChangeFinder, ([],), {'logicals': []}, TypeError,
+             "__init__() got an unexpected keyword argument 'logicals'"),
+            (f.FindChanges, ([], []), {1: 2}, TypeError, 'FindChanges() keywords must be strings'),
+            (sbc.SetLogicalLocalScopeDefined, (l,), {'name': 'x', 'logical': l}, TypeError,
+             "SetLogicalLocalScopeDefined() got multiple values for keyword argument 'logical'"),
+            # List parameters take the exact type, checked in parameter order.
+            (f.FindChanges, ([], ()), {}, TypeError, TypeMessage('removed_list', 'list', 'tuple')),
+            (f.FindChanges, (MyList(self.lst), []), {}, TypeError,
+             TypeMessage('added_list', 'list', 'MyList')),
+            (f.FindChanges, ({}, ()), {}, TypeError, TypeMessage('added_list', 'list', 'dict')),
+            (f._ProcessAddedLogicals, ([], ()), {}, TypeError,
+             TypeMessage('indicies_to_check', 'list', 'tuple')),
+            # The constructor checks its list after parsing.
+            (CChangeFinder, (MyList(),), {}, TypeError, 'Expected list, got MyList'),
+            (f._UpdateLogicalScopeName, (l, 0, 5), {}, TypeError,
+             TypeMessage('scope_name', 'str', 'int')),
+            (f._UpdateContainingScope, (l, 0, u''), {}, TypeError,
+             TypeMessage('scope_name', 'str', 'unicode')),
+            (f._ProcessDedentedComments, (1.5,), {}, TypeError, None),
+            (f._ProcessDedentedComments, ('1',), {}, TypeError, None),
+            (f._FindScopeNameContainingLogical, (None,), {}, TypeError, None),
+            (f._PropagateScopeIndexChangeForward, ('a', 'b', 0, 1.0), {}, TypeError, None),
+            (f._ProcessDedentedComments, (2 ** 70,), {}, OverflowError, None),
+            (f._FindScopeIndexForLogical, (l, -2 ** 70), {}, OverflowError, None),
+            # None passes the type check and fails where it is used.
+            (f.FindChanges, (None, []), {}, TypeError, "object of type 'NoneType' has no len()"),
+        ]
+        for func, args, kwargs, exc, message in cases:
+            case = (func.__name__, args, kwargs)
+            try:
+                func(*args, **kwargs)
+                self.fail('%s not raised: %r' % (exc.__name__, case))
+            except exc as e:
+                self.assertEqual(str(e), message or str(e), case)
+        # Nothing ran: the finder is idle and the logical unchanged.
+        self.assertEqual(self.logical.fLocalScopeName, 'f#0')
+        self.assertEqual(self.logical.fScopeName, '')
         self.assertIs(f._fLogicalList, self.lst)
-
-    def testSingleParameter(self):
-        f = self.finder
-        self.assertTypeError('_ProcessRemovedLogicals() takes exactly one argument (2 given)',
-                             f._ProcessRemovedLogicals, [], [])
-        self.assertTypeError('_ProcessRemovedLogicals() takes exactly one argument (0 given)',
-                             f._ProcessRemovedLogicals)
-        self.assertTypeError('_ProcessDedentedComments() takes exactly one argument (2 given)',
-                             f._ProcessDedentedComments, 0, 1)
-        self.assertTypeError('GetFullNameForScopeDef() takes exactly one argument (0 given)',
-                             sbc.GetFullNameForScopeDef)
-        self.assertTypeError('LogicalCheck() takes exactly one argument (2 given)',
-                             sbc.LogicalCheck, 1, 2)
-        self.assertTypeError('IsDefKind() takes exactly one argument (0 given)', sbc.IsDefKind)
-
-
-class KeywordTest(ArgumentTestCase):
-
-    def testNoKeywordsForNoOrOneParameter(self):
-        f = self.finder
-        for func, kwargs in [(f._Clear, {'x': 1}), (f._PrepareForFind, {'x': 1}),
-                             (f._destroy_impl, {'x': 1}), (sbc.GetNowTime, {'x': 1}),
-                             (f._ProcessRemovedLogicals, {'removed_list': []}),
-                             (f._ProcessDedentedComments, {'first_comment_i': 0}),
-                             (f._FindScopeNameContainingLogical, {'i': 0}),
-                             (sbc.GetFullNameForScopeDef, {'scope_def': None}),
-                             (sbc.LogicalCheck, {'logical': None}),
-                             (sbc.OutOfTime, {'end_time': 0.0}),
-                             (sbc.IsDefKind, {'kind': 1}),
-                             (sbc.GetInfoBytesKind, {'ibytes': ''}),
-                             (sbc.DoubleValueForPyIntBits, {'l': 1})]:
-            self.assertTypeError('%s() takes no keyword arguments' % func.__name__, func, **kwargs)
-        self.assertIs(f._fLogicalList, self.lst)
+        self.assertEqual(f.FindChanges([], []), (set(), set(), set()))
 
     def testParametersByKeyword(self):
         lst = Read('class A:\n    pass\n')
@@ -111,113 +106,15 @@ class KeywordTest(ArgumentTestCase):
         s = set([1])
         self.assertTrue(sbc.PySet_InplaceOr(to_add=set([2]), set_obj=s))
         self.assertEqual(s, set([1, 2]))
-
-    def testOptionalParametersByKeyword(self):
-        f = self.finder
-        f._PrepareForFind()
+        self.finder._PrepareForFind()
         try:
-            f._LogicalInScopeChanged(self.lst[1], 'f#0', old_leaf_scope=None)
-            f._LogicalInScopeChanged(scope_name='f#0', logical=self.lst[1],
-                                     old_containing_scope=None)
+            self.finder._LogicalInScopeChanged(self.lst[1], 'f#0', old_leaf_scope=None)
+            self.finder._LogicalInScopeChanged(scope_name='f#0', logical=self.lst[1],
+                                               old_containing_scope=None)
         finally:
-            f._Clear()
+            self.finder._Clear()
 
-    def testUnexpectedKeyword(self):
-        self.assertTypeError("FindChanges() got an unexpected keyword argument 'bogus'",
-                             self.finder.FindChanges, [], [], bogus=1)
-        self.assertTypeError("__init__() got an unexpected keyword argument 'logicals'",
-                             CChangeFinder, [], logicals=[])
-        self.assertTypeError("PySet_InplaceOr() got an unexpected keyword argument 'other'",
-                             sbc.PySet_InplaceOr, set(), set(), other=1)
-
-    def testKeywordThatIsNotAString(self):
-        # A Python-level wrapper would refuse such keywords itself.
-        self.assertTypeError('FindChanges() keywords must be strings',
-                             lambda: self.finder.FindChanges([], [], **{1: 2}))
-        self.assertTypeError('SetLogicalLocalScopeDefined() keywords must be strings',
-                             lambda: sbc.SetLogicalLocalScopeDefined(self.logical, 'x', **{(): 1}))
-        self.assertEqual(self.logical.fLocalScopeName, 'f#0')
-
-    def testParameterGivenTwice(self):
-        self.assertTypeError("FindChanges() got multiple values for keyword argument 'added_list'",
-                             self.finder.FindChanges, [], removed_list=[], added_list=[])
-        self.assertTypeError(
-            "SetLogicalLocalScopeDefined() got multiple values for keyword argument 'logical'",
-            sbc.SetLogicalLocalScopeDefined, self.logical, name='x', logical=self.logical)
-        self.assertEqual(self.logical.fLocalScopeName, 'f#0')
-
-
-class TypeCheckTest(ArgumentTestCase):
-
-    def testListParameters(self):
-        f = self.finder
-        self.assertTypeError(
-            "Argument 'added_list' has incorrect type (expected list, got tuple)",
-            f.FindChanges, (), [])
-        self.assertTypeError(
-            "Argument 'removed_list' has incorrect type (expected list, got tuple)",
-            f.FindChanges, [], ())
-        # The exact type: a subclass of list is refused.
-        self.assertTypeError(
-            "Argument 'added_list' has incorrect type (expected list, got MyList)",
-            f.FindChanges, MyList(self.lst), [])
-        # Checked in parameter order.
-        self.assertTypeError(
-            "Argument 'added_list' has incorrect type (expected list, got dict)",
-            f.FindChanges, {}, ())
-        self.assertTypeError(
-            "Argument 'removed_list' has incorrect type (expected list, got tuple)",
-            f._ProcessRemovedLogicals, ())
-        self.assertTypeError(
-            "Argument 'indicies_to_check' has incorrect type (expected list, got tuple)",
-            f._ProcessAddedLogicals, [], ())
-
-    def testNoneIsAcceptedOnEntryAndFailsWhereUsed(self):
-        self.assertTypeError("object of type 'NoneType' has no len()",
-                             self.finder.FindChanges, None, [])
-        # The failure came from inside: the finder is idle again.
-        self.assertEqual(self.finder.FindChanges([], []), (set(), set(), set()))
-
-    def testStrParameters(self):
-        f = self.finder
-        f._PrepareForFind()
-        try:
-            for method in f._UpdateLogicalScopeName, f._UpdateContainingScope:
-                self.assertTypeError(
-                    "Argument 'scope_name' has incorrect type (expected str, got int)",
-                    method, self.logical, 0, 5)
-                self.assertTypeError(
-                    "Argument 'scope_name' has incorrect type (expected str, got unicode)",
-                    method, self.logical, 0, u'')
-        finally:
-            f._Clear()
-        self.assertEqual(self.logical.fScopeName, '')
-
-    def testIntegerParameters(self):
-        f = self.finder
-        self.assertRaises(TypeError, f._ProcessDedentedComments, 1.5)
-        self.assertRaises(TypeError, f._ProcessDedentedComments, '1')
-        self.assertRaises(TypeError, f._GetLeafScopeWithIndex, self.logical, 1.0)
-        self.assertRaises(TypeError, f._FindScopeNameContainingLogical, None)
-        self.assertRaises(TypeError, f._UpdateContainingScope, self.logical, 0.0, '')
-        self.assertRaises(TypeError, f._PropagateScopeIndexChangeForward, 'a', 'b', 0, 1.0)
-        self.assertRaises(OverflowError, f._ProcessDedentedComments, 2 ** 70)
-        self.assertRaises(OverflowError, f._FindScopeIndexForLogical, self.logical, -2 ** 70)
-
-    def testArgumentErrorsComeBeforeTheRecursionGuard(self):
-        f = self.finder
-        f._PrepareForFind()
-        try:
-            self.assertTypeError(
-                "Argument 'added_list' has incorrect type (expected list, got tuple)",
-                f.FindChanges, (), [])
-            self.assertTypeError('FindChanges() takes exactly 2 positional arguments (1 given)',
-                                 f.FindChanges, [])
-            self.assertRaises(ValueError, f.FindChanges, [], [])
-        finally:
-            f._Clear()
-
-    def testArgumentErrorsComeBeforeAnyStep(self):
+    def testArgumentErrorsComeBeforeTheGuardAndAnyStep(self):
         calls = []
 
         class Finder(CChangeFinder):
@@ -226,14 +123,16 @@ class TypeCheckTest(ArgumentTestCase):
                 CChangeFinder._PrepareForFind(self)
 
         finder = Finder(self.lst)
-        self.assertRaises(TypeError, finder.FindChanges, [], (), )
+        self.assertRaises(TypeError, finder.FindChanges, [], ())
         self.assertRaises(TypeError, finder.FindChanges, [], [], bogus=1)
         self.assertEqual(calls, [])
-
-    def testInitChecksTheListAfterParsing(self):
-        self.assertTypeError('Expected list, got tuple', CChangeFinder, ())
-        self.assertTypeError('Expected list, got MyList', CChangeFinder, MyList())
-        self.assertIsNone(CChangeFinder(None)._fLogicalList)
+        finder._PrepareForFind()
+        try:
+            self.assertRaises(TypeError, finder.FindChanges, (), [])
+            self.assertRaises(TypeError, finder.FindChanges, [])
+            self.assertRaises(ValueError, finder.FindChanges, [], [])
+        finally:
+            finder._Clear()
 
 
 if __name__ == '__main__':

@@ -1,13 +1,12 @@
 """CChangeFinder's life cycle and the FindChanges driver: strategy, result, guard, exits."""
 
-import ast
 import sys
 import unittest
 
 from tallowkit.destroyable import CDestroyable
 from pysource.scopebodycache import CChangeFinder
 
-from support import CapturedStderr, Edit, Names, Read, RunPython, WholeListNames
+from support import CapturedStderr, Edit, ImportWith, Names, Read, WholeListNames
 
 kSource = '''\
 class A:
@@ -19,40 +18,66 @@ class A:
 def g():
     return 2
 '''
+kRecursive = 'FindChanges cannot be called recursively'
+kErrors = dict((name, KeyError(name)) for name in ['prepare', 'prepared', 'whole', 'clear'])
 
 
 class Recorder(CChangeFinder):
-    """Delegates every driver-level step and records the calls."""
+    """Records the driver-level steps; `fail` names the points that raise."""
+    fail = ()
+    removed_result = 'delegate'
 
     def __init__(self, lst):
-        self.calls = []
+        self.calls, self.seen = [], []
         CChangeFinder.__init__(self, lst)
+
+    def Raise(self, point):
+        if point in self.fail:
+            raise kErrors[point]
 
     def _Clear(self):
         self.calls.append('clear')
+        try:  # Python code that raises and catches must not disturb a pending error
+            {}['missing']
+        except KeyError:
+            pass
         CChangeFinder._Clear(self)
+        self.Raise('clear')
 
     def _PrepareForFind(self):
         self.calls.append('prepare')
+        self.Raise('prepare')
         CChangeFinder._PrepareForFind(self)
+        self.Raise('prepared')
 
     def _ProcessRemovedLogicals(self, removed_list):
-        self.calls.append(('removed', removed_list))
-        return CChangeFinder._ProcessRemovedLogicals(self, removed_list)
+        self.calls.append('removed')
+        if 'caught' in self.fail:
+            try:
+                self.FindChanges([], [])
+            except ValueError as e:
+                self.calls.append(str(e))
+        self.seen = [removed_list, CChangeFinder._ProcessRemovedLogicals(self, removed_list)]
+        return self.seen[1] if self.removed_result == 'delegate' else self.removed_result
 
     def _FindChangesEntireListAdded(self):
         self.calls.append('whole')
+        self.Raise('whole')
+        if 'nested' in self.fail:
+            self.FindChanges(self._fLogicalList, [])
         CChangeFinder._FindChangesEntireListAdded(self)
 
     def _ProcessAddedLogicals(self, added_list, indicies_to_check):
-        self.calls.append(('added', added_list, indicies_to_check))
-        CChangeFinder._ProcessAddedLogicals(self, added_list, indicies_to_check)
+        self.calls.append('added')
+        self.seen += [added_list, indicies_to_check]
+        if indicies_to_check is not None:  # the built-in step would fail on None
+            CChangeFinder._ProcessAddedLogicals(self, added_list, indicies_to_check)
 
 
-class DriverTestCase(unittest.TestCase):
+class DriverTest(unittest.TestCase):
 
     def assertIdle(self, finder):
-        """Idle: a new call is not refused as recursive, and runs from clean state."""
+        """Idle: a new call is not refused, and runs from a clean state."""
         lst = finder._fLogicalList
         self.assertEqual(finder.FindChanges(list(lst), []),
                          CChangeFinder(lst).FindChanges(list(lst), []))
@@ -61,22 +86,21 @@ class DriverTestCase(unittest.TestCase):
         with self.assertRaises(exc) as cm:
             func(*args)
         self.assertEqual(str(cm.exception), message)
-        return cm.exception
-
-
-class ConstructionTest(DriverTestCase):
 
     def testHoldsTheCallersList(self):
         lst = Read('x = 1\n')
         finder = CChangeFinder(lst)
         self.assertIs(finder._fLogicalList, lst)
-        # Later edits of the list are seen.
         lst.extend(Read('\nclass B:\n    y = 2\n')[1:])
         self.assertEqual(finder.FindChanges(lst, []), (set(['', 'B#0']), set(['B#0']), set()))
         self.assertEqual(Names(lst), [('', None), ('', 'B#0'), ('B#0', None)])
 
-    def testInitClearsThroughTheStep(self):
+    def testInit(self):
         finder = Recorder([])
+        self.assertEqual(finder.calls, ['clear'])
+        # A wrong type is refused before clearing.
+        self.assertRaisesMessage(TypeError, 'Expected list, got tuple',
+                                 CChangeFinder.__init__, finder, ())
         self.assertEqual(finder.calls, ['clear'])
         # A second __init__ replaces the list and ends a find in progress.
         finder._PrepareForFind()
@@ -85,16 +109,8 @@ class ConstructionTest(DriverTestCase):
         self.assertIs(finder._fLogicalList, other)
         self.assertEqual(finder.FindChanges(other, [])[2], set(['f#0']))
 
-    def testInitWithAWrongType(self):
-        finder = Recorder([])
-        del finder.calls[:]
-        self.assertRaisesMessage(TypeError, 'Expected list, got tuple', finder.__init__, ())
-        self.assertEqual(finder.calls, [])
-        self.assertRaisesMessage(TypeError, 'Expected list, got tuple', CChangeFinder, ())
-
     def testNoListUntilUsed(self):
-        # Allocated without __init__, or given None: the first pass fails,
-        # and the finder stays usable.
+        # Allocated without __init__, or given None: each pass fails, the finder stays usable.
         for finder in CChangeFinder.__new__(CChangeFinder), CChangeFinder(None):
             self.assertIsNone(finder._fLogicalList)
             for _ in range(2):
@@ -102,87 +118,51 @@ class ConstructionTest(DriverTestCase):
                                          finder.FindChanges, [], [])
 
     def testBaseInitRunsFirst(self):
-        # A stand-in base class records its __init__; it has the real
-        # instance size and method table, so the module accepts it.
-        status, out, err = RunPython(r'''
-            import ctypes, sys, types
-            import tallowkit.destroyable as TD
-            real = TD.CDestroyable
-            count = (real.__basicsize__ - object.__basicsize__) // ctypes.sizeof(ctypes.c_void_p)
-            calls = []
-            fail = []
-            class Base(object):
-                __slots__ = tuple('s%d' % k for k in range(count))
-                __vtable__ = real.__dict__['__vtable__']
-                def __init__(self):
-                    calls.append('base')
-                    if fail:
-                        raise KeyError('base')
-            sub = types.ModuleType(TD.__name__)
-            sub.__dict__.update(TD.__dict__)
-            sub.CDestroyable = Base
-            sys.modules[TD.__name__] = sub
-            from pysource.scopebodycache import CChangeFinder
-            class F(CChangeFinder):
-                def _Clear(self):
-                    calls.append('clear')
-                    CChangeFinder._Clear(self)
-            out = []
-            def Try(*args):
-                del calls[:]
+        # A stand-in base class with the real size and method table records its __init__.
+        result = ImportWith("""
+            calls, fail = [], []
+            def BaseInit(self):
+                calls.append('base')
+                if fail:
+                    raise KeyError('base')
+            Substitute(TD, CDestroyable=Slotted(
+                TD.CDestroyable.__basicsize__, __init__=BaseInit,
+                __vtable__=TD.CDestroyable.__dict__['__vtable__']))
+            """, """
+            F = type('F', (mod.CChangeFinder,), {'_Clear': lambda self: calls.append('clear')})
+            out = result['out'] = []
+            for args, failing in [(([],), []), (((),), []), ((), []), (([],), [1])]:
+                calls[:], fail[:] = [], failing
                 try:
                     F(*args)
-                    out.append((list(calls), None))
+                    out.append((calls[:], None))
                 except Exception as e:
-                    out.append((list(calls), '%s: %s' % (type(e).__name__, e)))
-            Try([])
-            Try(())
-            Try()
-            fail.append(1)
-            Try([])
+                    out.append((calls[:], '%s: %s' % (type(e).__name__, e)))
             finder = F.__new__(F)
             try:
                 finder.__init__([1])
             except KeyError:
-                pass
-            out.append(finder._fLogicalList)
-            print repr(out)
-            ''')
-        self.assertEqual(status, 0, err)
-        self.assertEqual(ast.literal_eval(out.strip()), [
-            (['base', 'clear'], None),
-            (['base'], 'TypeError: Expected list, got tuple'),
+                out.append(finder._fLogicalList)
+            """)
+        self.assertEqual(result['out'], [
+            (['base', 'clear'], None), (['base'], 'TypeError: Expected list, got tuple'),
             ([], 'TypeError: __init__() takes exactly 1 positional argument (0 given)'),
-            (['base'], "KeyError: 'base'"),
-            None,
-        ])
+            (['base'], "KeyError: 'base'"), None])
 
-
-class StrategyTest(DriverTestCase):
-
-    def testWholeListWhenCountsMatch(self):
+    def testWholeListWhenTheCountsMatch(self):
         lst = Read(kSource)
-        finder = Recorder(lst)
-        removed = []
-        finder.calls = []
-        result = finder.FindChanges(lst, removed)
-        self.assertEqual(finder.calls, ['prepare', ('removed', removed), 'whole', 'clear'])
-        self.assertIs(finder.calls[1][1], removed)
-        self.assertEqual(result, (set(['', 'A#0', 'A#0.f#0', 'A#0.f#1', 'g#0']), set(['A#0']),
-                                  set(['A#0.f#0', 'A#0.f#1', 'g#0'])))
-
-    def testOnlyTheCountOfAddedLogicalsMatters(self):
-        lst = Read(kSource)
-        expected = CChangeFinder(lst).FindChanges(lst, [])
-        names = Names(lst)
-        for l in lst:
-            l.fScopeName = l.fLocalScopeName = None
-        finder = Recorder(lst)
-        self.assertEqual(finder.FindChanges([None] * len(lst), []), expected)
-        self.assertIn('whole', finder.calls)
-        self.assertEqual(Names(lst), names)
-
-    def testEmptyListTakesTheWholeListPath(self):
+        expected = (set(['', 'A#0', 'A#0.f#0', 'A#0.f#1', 'g#0']), set(['A#0']),
+                    set(['A#0.f#0', 'A#0.f#1', 'g#0']))
+        names = WholeListNames(kSource)
+        # Only the count of added logicals matters, not what they are.
+        for added in lst, [None] * len(lst):
+            finder = Recorder(lst)
+            finder.calls = []
+            self.assertEqual(finder.FindChanges(added, []), expected)
+            self.assertEqual(finder.calls, ['prepare', 'removed', 'whole', 'clear'])
+            self.assertEqual(Names(lst), names)
+            for l in lst:
+                l.fScopeName = l.fLocalScopeName = None
         finder = Recorder([])
         self.assertEqual(finder.FindChanges([], []), (set(['']), set(), set()))
         self.assertIn('whole', finder.calls)
@@ -191,302 +171,94 @@ class StrategyTest(DriverTestCase):
         lst = Read(kSource)
         CChangeFinder(lst).FindChanges(lst, [])
         added, removed = Edit(lst, kSource.replace('x = 1', 'x = 3'))
-        indices = []
-
-        class Finder(Recorder):
-            def _ProcessRemovedLogicals(self, removed_list):
-                indices.append(Recorder._ProcessRemovedLogicals(self, removed_list))
-                return indices[-1]
-
-        finder = Finder(lst)
+        finder = Recorder(lst)
         finder.calls = []
         self.assertEqual(finder.FindChanges(added, removed), (set(['A#0.f#1']), set(), set()))
-        self.assertEqual([c if isinstance(c, str) else c[0] for c in finder.calls],
-                         ['prepare', 'removed', 'added', 'clear'])
-        self.assertIs(finder.calls[2][1], added)
-        self.assertIs(finder.calls[2][2], indices[0])
-        self.assertIsInstance(indices[0], list)
-
-    def testRemovedIndicesMustBeAListOrNone(self):
-        lst = Read(kSource)
-        CChangeFinder(lst).FindChanges(lst, [])
-
-        class Finder(Recorder):
-            result = ()
-
-            def _ProcessRemovedLogicals(self, removed_list):
-                return self.result
-
-            def _ProcessAddedLogicals(self, added_list, indicies_to_check):
-                self.calls.append(('added', added_list, indicies_to_check))
-
-        finder = Finder(lst)
-        finder.calls = []
-        self.assertRaisesMessage(TypeError, 'Expected list, got tuple',
-                                 finder.FindChanges, [], [])
-        self.assertEqual(finder.calls, ['prepare', 'clear'])
-        self.assertIdle(finder)
-        # The whole-list pass ignores that result.
+        self.assertEqual(finder.calls, ['prepare', 'removed', 'added', 'clear'])
+        indices = finder.seen[1]
+        self.assertIs(type(indices), list)
+        self.assertEqual(map(id, finder.seen), map(id, [removed, indices, added, indices]))
+        # That result must be a list or None; the whole-list pass ignores it.
+        finder.removed_result, finder.calls = (), []
+        self.assertRaisesMessage(TypeError, 'Expected list, got tuple', finder.FindChanges, [], [])
+        self.assertEqual(finder.calls, ['prepare', 'removed', 'clear'])
         self.assertEqual(finder.FindChanges(lst, [])[1], set(['A#0']))
-        finder.result = None
-        finder.calls = []
+        finder.removed_result = None
         finder.FindChanges([], [])
-        self.assertEqual(finder.calls, ['prepare', ('added', [], None), 'clear'])
-
-    def testNamelessDefinitionOpensNoScope(self):
-        source = 'class A:\n    def\n        x = 1\n    y = 2\n'
-        lst = Read(source)
-        finder = CChangeFinder(lst)
-        with CapturedStderr() as err:
-            self.assertEqual(finder.FindChanges(lst, []), (set(['', 'A#0']), set(['A#0']), set()))
-            self.assertEqual(Names(lst), [('', 'A#0')] + [('A#0', None)] * 3)
-            for new_source in [source.replace('x = 1', 'x = 2'),
-                               source.replace('def', 'def f():'), source]:
-                added, removed = Edit(lst, new_source)
-                finder.FindChanges(added, removed)
-                self.assertEqual(Names(lst), WholeListNames(new_source))
-        self.assertEqual(err.getvalue(), '')
+        self.assertEqual(finder.seen[2:], [[], None])
 
     def testIncrementalEditsMatchAFreshPass(self):
-        # A class or function change makes the driver renumber to the end.
-        edits = [
-            kSource.replace('x = 1', 'x = 3'),
-            'def f():\n    pass\n' + kSource,
-            kSource.replace('    def f(self):\n        pass\n', ''),
-            kSource.replace('class A:', 'class A(object):'),
-            kSource.replace('def g():', 'def f():'),
-            kSource + 'class A:\n    def f(self):\n        pass\n',
-        ]
-        for new_source in edits:
-            lst = Read(kSource)
+        nameless = 'class A:\n    def\n        x = 1\n    y = 2\n'
+        self.assertEqual(WholeListNames(nameless), [('', 'A#0')] + [('A#0', None)] * 3)
+        for source, new_source in [
+                (kSource, kSource.replace('x = 1', 'x = 3')),
+                (kSource, 'def f():\n    pass\n' + kSource),
+                (kSource, kSource.replace('    def f(self):\n        pass\n', '')),
+                (kSource, kSource.replace('class A:', 'class A(object):')),
+                (kSource, kSource.replace('def g():', 'def f():')),
+                (kSource, kSource + 'class A:\n    def f(self):\n        pass\n'),
+                # A nameless definition opens no scope.
+                (nameless, nameless.replace('x = 1', 'x = 2')),
+                (nameless, nameless.replace('def', 'def f():')),
+                (nameless.replace('def', 'def f():'), nameless)]:
+            lst = Read(source)
             finder = CChangeFinder(lst)
-            finder.FindChanges(lst, [])
-            added, removed = Edit(lst, new_source)
-            finder.FindChanges(added, removed)
+            with CapturedStderr() as err:
+                finder.FindChanges(lst, [])
+                finder.FindChanges(*Edit(lst, new_source))
             self.assertEqual(Names(lst), WholeListNames(new_source), new_source)
+            self.assertEqual(err.getvalue(), '')
 
-
-class ResultTest(DriverTestCase):
-
-    def testEachCallMakesNewSets(self):
+    def testEachCallMakesNewSetsAndKeepsNoReference(self):
         lst = Read(kSource)
         finder = CChangeFinder(lst)
-        first = finder.FindChanges(lst, [])
-        saved = [set(s) for s in first]
-        second = finder.FindChanges(lst, [])
-        self.assertIsInstance(first, tuple)
-        self.assertEqual(len(first), 3)
-        for a, b, copy in zip(first, second, saved):
-            self.assertIs(type(a), set)
+        first, second = finder.FindChanges(lst, []), finder.FindChanges(lst, [])
+        self.assertEqual(map(sys.getrefcount, second), [2, 2, 2])
+        self.assertEqual((type(first), len(first)), (tuple, 3))
+        for a, b in zip(first, second):
+            self.assertEqual((type(a), a), (set, b))
             self.assertIsNot(a, b)
-            self.assertEqual(a, copy)
-        first[0].clear()
-        self.assertTrue(second[0])
 
-    def testTheFinderKeepsNoReferenceToTheSets(self):
+    def testStateAfterEachKindOfExit(self):
+        done = ['prepare', 'removed', 'whole', 'clear']
+        # (failure points, expected error, steps called, busy afterwards)
+        for fail, error, calls, busy in [
+                ((), None, done, False),
+                (('whole',), 'whole', done, False),
+                (('clear',), 'clear', done, False),  # the result is dropped
+                (('whole', 'clear'), 'clear', done, False),  # the pending error is replaced
+                (('bad',), (TypeError, 'Argument must be a logical'), done, False),
+                # The refused nested call neither prepares nor clears.
+                (('nested',), (ValueError, kRecursive), done, False),
+                (('caught',), None, ['prepare', 'removed', kRecursive, 'whole', 'clear'], False),
+                (('prepare',), 'prepare', ['prepare'], False),
+                # Prepared, then failed: nothing clears, so the finder stays busy.
+                (('prepared',), 'prepared', ['prepare'], True)]:
+            lst = Read(kSource)
+            finder = Recorder(lst)
+            finder.fail, finder.calls = fail, []
+            if 'bad' in fail:
+                lst.append(5)
+            try:
+                finder.FindChanges(lst, [])
+                got = None
+            except Exception as e:
+                got = e if isinstance(error, str) else (type(e), str(e))
+            self.assertEqual((got, finder.calls), (kErrors.get(error, error), calls), fail)
+            if 'bad' in fail:
+                lst.pop()
+                self.assertEqual(lst[0].fLocalScopeName, 'A#0')  # names written stay
+            finder.fail, finder.calls = (), []
+            if busy:
+                for _ in range(2):
+                    self.assertRaisesMessage(ValueError, kRecursive, finder.FindChanges, lst, [])
+                self.assertEqual(finder.calls, [])
+                finder._Clear()
+            self.assertIdle(finder)
+
+    def testDestroy(self):
         lst = Read(kSource)
-        finder = CChangeFinder(lst)
-        contents, classes, functions = finder.FindChanges(lst, [])
-        self.assertEqual(sys.getrefcount(contents), 2)
-        self.assertEqual(sys.getrefcount(classes), 2)
-        self.assertEqual(sys.getrefcount(functions), 2)
-
-
-class GuardTest(DriverTestCase):
-
-    def testNestedCallIsRefusedAndTheOuterCallFails(self):
-        lst = Read(kSource)
-
-        class Finder(Recorder):
-            armed = True
-
-            def _FindChangesEntireListAdded(self):
-                if self.armed:
-                    self.calls.append('whole')
-                    self.FindChanges(lst, [])
-                Recorder._FindChangesEntireListAdded(self)
-
-        finder = Finder(lst)
-        finder.calls = []
-        self.assertRaisesMessage(ValueError, 'FindChanges cannot be called recursively',
-                                 finder.FindChanges, lst, [])
-        # The refused call neither prepared nor cleared.
-        self.assertEqual(finder.calls, ['prepare', ('removed', []), 'whole', 'clear'])
-        finder.armed = False
-        self.assertIdle(finder)
-
-    def testRefusedNestedCallLeavesTheOuterStateAlone(self):
-        lst = Read(kSource)
-        expected = CChangeFinder(lst).FindChanges(lst, [])
-        refused = []
-
-        class Finder(Recorder):
-            def _ProcessRemovedLogicals(self, removed_list):
-                try:
-                    self.FindChanges([], [])
-                except ValueError as e:
-                    refused.append(str(e))
-                return Recorder._ProcessRemovedLogicals(self, removed_list)
-
-        finder = Finder(lst)
-        finder.calls = []
-        self.assertEqual(finder.FindChanges(lst, []), expected)
-        self.assertEqual(refused, ['FindChanges cannot be called recursively'])
-        self.assertEqual(finder.calls.count('prepare'), 1)
-        self.assertEqual(finder.calls.count('clear'), 1)
-
-    def testDirectPrepareBlocksUntilClear(self):
-        lst = Read(kSource)
-        finder = Recorder(lst)
-        finder._PrepareForFind()
-        finder.calls = []
-        for _ in range(2):
-            self.assertRaisesMessage(ValueError, 'FindChanges cannot be called recursively',
-                                     finder.FindChanges, lst, [])
-        self.assertEqual(finder.calls, [])
-        finder._Clear()
-        self.assertIdle(finder)
-
-
-class ExitTest(DriverTestCase):
-
-    def testFailureInsideAPassClears(self):
-        lst = Read(kSource)
-        finder = Recorder(lst)
-        lst.append(5)
-        finder.calls = []
-        self.assertRaisesMessage(TypeError, 'Argument must be a logical',
-                                 finder.FindChanges, lst, [])
-        self.assertEqual(finder.calls[-1], 'clear')
-        # Names written before the failure stay.
-        self.assertEqual(lst[0].fLocalScopeName, 'A#0')
-        lst.pop()
-        self.assertIdle(finder)
-
-    def testOverrideErrorPropagatesUnchanged(self):
-        lst = Read(kSource)
-        error = KeyError('step')
-
-        class Finder(Recorder):
-            def _FindChangesEntireListAdded(self):
-                raise error
-
-        finder = Finder(lst)
-        finder.calls = []
-        with self.assertRaises(KeyError) as cm:
-            finder.FindChanges(lst, [])
-        self.assertIs(cm.exception, error)
-        self.assertEqual(finder.calls[-1], 'clear')
-        del Finder._FindChangesEntireListAdded
-        self.assertIdle(finder)
-
-    def testClearRunsWithThePendingErrorSetAside(self):
-        lst = Read(kSource)
-        seen = []
-
-        class Finder(CChangeFinder):
-            def _FindChangesEntireListAdded(self):
-                raise KeyError('step')
-
-            def _Clear(self):
-                # Python code that itself raises and catches must work here.
-                try:
-                    {}['missing']
-                except KeyError:
-                    seen.append(sys.exc_info()[1].args)
-                CChangeFinder._Clear(self)
-
-        finder = Finder(lst)
-        del seen[:]
-        with self.assertRaises(KeyError) as cm:
-            finder.FindChanges(lst, [])
-        self.assertEqual(cm.exception.args, ('step',))
-        self.assertEqual(seen, [('missing',)])
-
-    def testClearErrorWins(self):
-        lst = Read(kSource)
-
-        class Finder(CChangeFinder):
-            armed = False
-            fail_step = False
-
-            def _FindChangesEntireListAdded(self):
-                if self.fail_step:
-                    raise KeyError('step')
-                CChangeFinder._FindChangesEntireListAdded(self)
-
-            def _Clear(self):
-                CChangeFinder._Clear(self)
-                if self.armed:
-                    raise IndexError('clear')
-
-        finder = Finder(lst)
-        finder.armed = True
-        # On success the result is dropped; on failure the pending error is replaced.
-        self.assertRaisesMessage(IndexError, 'clear', finder.FindChanges, lst, [])
-        finder.fail_step = True
-        self.assertRaisesMessage(IndexError, 'clear', finder.FindChanges, lst, [])
-        finder.armed = finder.fail_step = False
-        self.assertIdle(finder)
-
-    def testPrepareErrorSkipsClear(self):
-        lst = Read(kSource)
-
-        class Finder(Recorder):
-            mode = None
-
-            def _PrepareForFind(self):
-                self.calls.append('prepare')
-                if self.mode != 'before':
-                    CChangeFinder._PrepareForFind(self)
-                if self.mode:
-                    raise KeyError(self.mode)
-
-        finder = Finder(lst)
-        finder.mode = 'before'
-        finder.calls = []
-        self.assertRaises(KeyError, finder.FindChanges, lst, [])
-        self.assertEqual(finder.calls, ['prepare'])
-        # Prepared, then failed: nothing clears, so the finder stays busy.
-        finder.mode = 'after'
-        self.assertRaises(KeyError, finder.FindChanges, lst, [])
-        finder.mode = None
-        self.assertRaisesMessage(ValueError, 'FindChanges cannot be called recursively',
-                                 finder.FindChanges, lst, [])
-        self.assertNotIn('clear', finder.calls)
-        finder._Clear()
-        self.assertIdle(finder)
-
-
-class DestroyTest(DriverTestCase):
-
-    def testDestroyImpl(self):
-        lst = Read(kSource)
-        finder = Recorder(lst)
-        finder._PrepareForFind()
-        finder.calls = []
-        self.assertIsNone(finder._destroy_impl())
-        self.assertIsNone(finder._fLogicalList)
-        self.assertEqual(finder.calls, ['clear'])
-        # Cleared: the call is not refused, it fails on the missing list.
-        self.assertRaisesMessage(TypeError, "object of type 'NoneType' has no len()",
-                                 finder.FindChanges, [], [])
-        self.assertEqual(finder.calls[-1], 'clear')
-        self.assertRaisesMessage(TypeError, "object of type 'NoneType' has no len()",
-                                 finder.FindChanges, [], [])
-        # Its methods still run.
-        finder._PrepareForFind()
-        finder._Clear()
-        finder._destroy_impl()
-
-    def testDestroyCallsDestroyImpl(self):
-        lst = Read(kSource)
-        finder = CChangeFinder(lst)
-        self.assertIsInstance(finder, CDestroyable)
-        finder.destroy()
-        self.assertTrue(finder.IsDestroyed())
-        self.assertIsNone(finder._fLogicalList)
-
+        self.assertIsInstance(CChangeFinder(lst), CDestroyable)
         destroyed = []
 
         class Finder(Recorder):
@@ -495,12 +267,21 @@ class DestroyTest(DriverTestCase):
                 Recorder._destroy_impl(self)
 
         finder = Finder(lst)
+        finder._PrepareForFind()
         finder.calls = []
         finder.destroy()
         finder.destroy()
-        self.assertEqual(destroyed, [finder])
-        self.assertEqual(finder.calls, ['clear'])
+        self.assertTrue(finder.IsDestroyed())
+        self.assertEqual((destroyed, finder.calls), ([finder], ['clear']))
         self.assertIsNone(finder._fLogicalList)
+        # Cleared: a call is not refused, it fails on the missing list; methods still run.
+        for _ in range(2):
+            self.assertRaisesMessage(TypeError, "object of type 'NoneType' has no len()",
+                                     finder.FindChanges, [], [])
+            self.assertEqual(finder.calls[-1], 'clear')
+        finder._PrepareForFind()
+        finder._Clear()
+        self.assertIsNone(finder._destroy_impl())
 
 
 if __name__ == '__main__':

@@ -22,233 +22,185 @@ def g():
     return 2
 '''
 
-
-def Raises(exc, func, *args, **kwargs):
-    try:
-        func(*args, **kwargs)
-    except exc:
-        return
-    raise AssertionError('%s not raised by %r' % (exc.__name__, func))
+# Each scenario returns (a function to repeat, the objects whose counts must stay).
 
 
-class LeakTestCase(unittest.TestCase):
+def Calls(*calls):
+    """One function making each call (func, args..., expected exception or None)."""
+    def Run():
+        for call in calls:
+            try:
+                call[0](*call[1:-1])
+            except Exception as e:
+                assert call[-1] is not None and isinstance(e, call[-1]), (call, e)
+            else:
+                assert call[-1] is None, (call, 'no error')
+    return Run
 
-    def assertFlat(self, func, *watched):
-        """Runs func kRepeats times; watched objects' counts and the GC population stay."""
+
+def Prepared(cls=CChangeFinder):
+    lst = Read(kSource)
+    finder = cls(lst)
+    finder.FindChanges(lst, [])
+    return lst, finder, [lst, finder] + lst + [t for l in lst for t in l.fTokens]
+
+
+def Swapping(finder, lst, i, other):
+    """Puts `other` and the original logical at lst[i] by turns, finding the changes."""
+    state = [lst[i], other]
+
+    def Run():
+        lst[i] = state[1]
+        with CapturedStderr():
+            finder.FindChanges([state[1]], [state[0]])
+        state.reverse()
+    return Run, state
+
+
+def WholePass():
+    lst, finder, watched = Prepared()
+    removed = []
+
+    def Run():
+        assert map(sys.getrefcount, finder.FindChanges(lst, removed)) == [2, 2, 2]
+        # Names may be replaced by equal new strings; either way none piles up.
+        names = [n for l in lst for n in (l.fScopeName, l.fLocalScopeName) if n]
+        assert max(map(sys.getrefcount, names)) < 20
+    return Run, watched + [removed]
+
+
+def IncrementalPass():
+    lst, finder, watched = Prepared()
+    run, more = Swapping(finder, lst, 5, Logical(['x', '=', '2'], lst[5].fLineno, lst[5].fIndent))
+    return run, watched + more + [lst[4].fLocalScopeName]
+
+
+def OverridesAndReportedErrors():
+    def Raise(self, logical, i):
+        raise KeyError('reported')
+
+    lst, finder, watched = Prepared(type('Finder', (CChangeFinder,), {
+        '_FindScopeNameContainingLogical':
+            lambda self, i: CChangeFinder._FindScopeNameContainingLogical(self, i),
+        '_FindScopeIndexForLogical': Raise}))
+    other = Logical(['def', 'h', '(', ')', ':'], lst[1].fLineno, lst[1].fIndent, kDefKind)
+    run, more = Swapping(finder, lst, 1, other)
+    return run, watched + more
+
+
+def ScopeRenumbering():
+    lst, finder, watched = Prepared()
+    extra = Read('def g():\n    pass\n')
+
+    def Run():
+        lst[0:0] = extra
+        finder.FindChanges(extra, [])
+        del lst[0:2]
+        finder.FindChanges([], extra)
+    return Run, watched + extra
+
+
+def ConstructionAndCycles():
+    lst, _, watched = Prepared()
+    Finder = type('Finder', (CChangeFinder,), {})
+
+    def Run():
+        CChangeFinder(lst)
+        finder = Finder(lst)
+        finder.fSelf = finder
+        cyclic = []
+        cyclic.append(CChangeFinder(cyclic))
+        CChangeFinder(lst).destroy()
+    return Run, watched
+
+
+def ErrorPaths():
+    lst, finder, watched = Prepared()
+    bad = Read(kSource) + [['not a logical']]
+    busy, destroyed = CChangeFinder(lst), CChangeFinder(lst)
+    busy._PrepareForFind()
+    destroyed._destroy_impl()
+    failing = type('Failing', (CChangeFinder,), {
+        '_FindChangesEntireListAdded': lambda self: {}['step']})(lst)
+    tup = tuple(lst)
+    return Calls(
+        (finder.FindChanges, tup, [], TypeError), (finder.FindChanges, lst, TypeError),
+        (lambda: finder.FindChanges(lst, [], bogus=1), TypeError),
+        (lambda: finder.FindChanges(lst, removed_list=[], added_list=lst), TypeError),
+        (CChangeFinder, tup, TypeError),
+        (lambda: CChangeFinder(bad).FindChanges(bad, []), TypeError),
+        (busy.FindChanges, lst, [], ValueError), (failing.FindChanges, lst, [], KeyError),
+        (destroyed.FindChanges, lst, [], TypeError),
+        (finder._UpdateLogicalScopeName, lst[0], 0, 5, TypeError),
+        (finder._ProcessDedentedComments, 2 ** 70, OverflowError),
+    ), watched + bad + [tup, busy, failing]
+
+
+def ModuleFunctions():
+    lst, _, _ = Prepared()
+    scope_def, plain = lst[1], lst[2]
+    nameless = Logical(['def'], kind=kDefKind)
+    nameless.fScopeName = 'A#0'
+    d = Logical(['async', 'def', 'f', '(', ')', ':'], kind=kDefKind)
+    c = Logical(['\\', 'class'], kind=kClassKind)
+    stored, wrong = Logical(['x']), Logical(['def', 'f'], kind=kDefKind)
+    wrong.fLocalScopeName = 5
+    name, target, more, huge = 'g#2', set([1, 2]), frozenset([2, 3]), 2 ** 70
+
+    def Fresh():
+        full = GetFullNameForScopeDef(scope_def)
+        assert sys.getrefcount(full) == 2
+        with CapturedStderr():
+            sbc.GetInfoBytesKind(None)
+
+    return Calls(
+        (Fresh, None), (GetFullNameForScopeDef, None, None),
+        (GetFullNameForScopeDef, nameless, AssertionError),
+        (GetFullNameForScopeDef, plain, AssertionError), (GetFullNameForScopeDef, 1, TypeError),
+        (sbc.LogicalCheck, d, None), (sbc.LogicalCheck, None, None),
+        (sbc.RaiseIfNotLogical, d, None), (sbc.RaiseIfNotLogical, 1, TypeError),
+        (sbc.IsWhitespaceLogical, d, None), (sbc.IsScopeStartLogical, c, None),
+        (sbc.GetLocalScopeDefined, d, None), (sbc.GetLocalScopeDefined, c, None),
+        (sbc.SetLogicalLocalScopeDefined, stored, name, None),
+        (sbc.GetLocalScopeDefined, stored, None),
+        (sbc.SetLogicalLocalScopeDefined, stored, None, None),
+        (sbc.GetLocalScopeDefined, wrong, TypeError),
+        (sbc.SetLogicalLocalScopeDefined, 1, name, TypeError),
+        (sbc.PySet_InplaceOr, target, more, None), (sbc.PySet_InplaceOr, None, more, TypeError),
+        (sbc.PySet_InplaceOr, target, [4], TypeError), (sbc.PySet_InplaceOr, more, more, TypeError),
+        (sbc.GetNowTime, None), (sbc.OutOfTime, 0.0, None),
+        (lambda: sbc.DoubleValueForULongLongBits(sbc.ULongLongValueForDoubleBits(1.5)), None),
+        (sbc.DoubleValueForPyIntBits, -1, None),
+        (sbc.DoubleValueForULongLongBits, -1, OverflowError),
+        (sbc.DoubleValueForPyIntBits, huge, OverflowError),
+        (sbc.IsDefKind, 70, None), (sbc.IsDefKind, 128, OverflowError),
+        (sbc.GetInfoBytesKind, ':x', None), (sbc.GetInfoBytesKind, 5, TypeError),
+    ), ([scope_def, scope_def.fScopeName, scope_def.fLocalScopeName, nameless,
+         nameless.fScopeName, plain, d, c, stored, wrong, name, target, more, huge] +
+        list(d.fTokens) + list(target))
+
+
+class LeakTest(unittest.TestCase):
+
+    def assertFlat(self, func, watched, case):
+        """Runs func kRepeats times; the watched counts and the GC population stay."""
         for _ in range(10):
             func()
         gc.collect()
-        counts = [sys.getrefcount(o) for o in watched]
+        counts = map(sys.getrefcount, watched)
         population = len(gc.get_objects())
         for _ in range(kRepeats):
             func()
         gc.collect()
-        self.assertEqual([sys.getrefcount(o) for o in watched], counts)
+        self.assertEqual(map(sys.getrefcount, watched), counts, case)
         grown = len(gc.get_objects()) - population
-        self.assertLess(grown, 10, 'object count grew by %d' % grown)
-
-    def Logicals(self, lst):
-        """The logicals and the name objects they hold, to watch."""
-        objs = list(lst)
-        for l in lst:
-            objs.extend(t for t in l.fTokens)
-        return objs
+        self.assertLess(grown, 10, '%s: object count grew by %d' % (case, grown))
 
 
-class FinderLeakTest(LeakTestCase):
-
-    def testWholeListPass(self):
-        lst = Read(kSource)
-        finder = CChangeFinder(lst)
-        removed = []
-
-        def Run():
-            contents, classes, functions = finder.FindChanges(lst, removed)
-            assert sys.getrefcount(contents) == 2
-
-        self.assertFlat(Run, lst, removed, finder, *self.Logicals(lst))
-        # Names may be replaced by equal new strings; either way none piles up.
-        for l in lst:
-            for name in l.fScopeName, l.fLocalScopeName:
-                if name:
-                    self.assertLess(sys.getrefcount(name), 20, name)
-
-    def testIncrementalPass(self):
-        lst = Read(kSource)
-        finder = CChangeFinder(lst)
-        finder.FindChanges(lst, [])
-        # Two versions of one body line, swapped in and out.
-        one = lst[5]
-        two = Logical(['x', '=', '2'], one.fLineno, one.fIndent, 0)
-        state = [one, two]
-
-        def Run():
-            old, new = state
-            lst[5] = new
-            finder.FindChanges([new], [old])
-            state.reverse()
-
-        self.assertFlat(Run, lst, finder, one, two, lst[4], lst[4].fLocalScopeName)
-
-    def testScopeRenumbering(self):
-        lst = Read(kSource)
-        finder = CChangeFinder(lst)
-        finder.FindChanges(lst, [])
-        extra = Read('def g():\n    pass\n')
-
-        def Run():
-            lst[0:0] = extra
-            finder.FindChanges(extra, [])
-            del lst[0:2]
-            finder.FindChanges([], extra)
-
-        self.assertFlat(Run, lst, finder, *(extra + self.Logicals(lst)))
-
-    def testConstructionAndCycles(self):
-        lst = Read(kSource)
-
-        class Finder(CChangeFinder):
-            pass
-
-        def Run():
-            CChangeFinder(lst)
-            finder = Finder(lst)
-            finder.fSelf = finder
-            cyclic = []
-            cyclic.append(CChangeFinder(cyclic))
-            destroyed = CChangeFinder(lst)
-            destroyed.destroy()
-
-        self.assertFlat(Run, lst, *lst)
-
-    def testErrorPaths(self):
-        lst = Read(kSource)
-        bad = Read(kSource) + [['not a logical']]
-        finder = CChangeFinder(lst)
-        busy = CChangeFinder(lst)
-        busy._PrepareForFind()
-
-        class Failing(CChangeFinder):
-            def _FindChangesEntireListAdded(self):
-                raise KeyError('step')
-
-        failing = Failing(lst)
-        destroyed = CChangeFinder(lst)
-        destroyed._destroy_impl()
-        tup = tuple(lst)
-
-        def Run():
-            Raises(TypeError, finder.FindChanges, tup, [])
-            Raises(TypeError, finder.FindChanges, lst, [], bogus=1)
-            Raises(TypeError, finder.FindChanges, lst, removed_list=[], added_list=lst)
-            Raises(TypeError, finder.FindChanges, lst)
-            Raises(TypeError, CChangeFinder, tup)
-            Raises(TypeError, CChangeFinder(bad).FindChanges, bad, [])
-            Raises(ValueError, busy.FindChanges, lst, [])
-            Raises(KeyError, failing.FindChanges, lst, [])
-            Raises(TypeError, destroyed.FindChanges, lst, [])
-            Raises(TypeError, finder._UpdateLogicalScopeName, lst[0], 0, 5)
-            Raises(OverflowError, finder._ProcessDedentedComments, 2 ** 70)
-
-        self.assertFlat(Run, lst, tup, finder, busy, failing, *(bad + self.Logicals(lst)))
-
-    def testOverridesAndReportedErrors(self):
-        lst = Read(kSource)
-
-        class Finder(CChangeFinder):
-            def _FindScopeNameContainingLogical(self, i):
-                return CChangeFinder._FindScopeNameContainingLogical(self, i)
-
-            def _FindScopeIndexForLogical(self, logical, i):
-                raise KeyError('reported')
-
-        finder = Finder(lst)
-        finder.FindChanges(lst, [])
-        line = lst[1]
-        other = Logical(['def', 'h', '(', ')', ':'], line.fLineno, line.fIndent, kDefKind)
-        state = [line, other]
-
-        def Run():
-            old, new = state
-            lst[1] = new
-            with CapturedStderr():
-                finder.FindChanges([new], [old])
-            state.reverse()
-
-        self.assertFlat(Run, lst, finder, line, other, *lst)
-
-
-class FunctionLeakTest(LeakTestCase):
-
-    def testFullName(self):
-        lst = Read(kSource)
-        CChangeFinder(lst).FindChanges(lst, [])
-        scope_def = lst[1]
-        nameless = Logical(['def'], kind=kDefKind)
-        nameless.fScopeName = 'A#0'
-        plain = lst[2]
-
-        def Run():
-            name = GetFullNameForScopeDef(scope_def)
-            assert sys.getrefcount(name) == 2
-            GetFullNameForScopeDef(None)
-            Raises(AssertionError, GetFullNameForScopeDef, nameless)
-            Raises(AssertionError, GetFullNameForScopeDef, plain)
-            Raises(TypeError, GetFullNameForScopeDef, 1)
-
-        self.assertFlat(Run, scope_def, scope_def.fScopeName, scope_def.fLocalScopeName,
-                        nameless, nameless.fScopeName, plain)
-
-    def testLogicalAccessors(self):
-        d = Logical(['async', 'def', 'f', '(', ')', ':'], kind=kDefKind)
-        c = Logical(['\\', 'class'], kind=kClassKind)
-        stored = Logical(['x'], kind=0)
-        wrong = Logical(['def', 'f'], kind=kDefKind)
-        wrong.fLocalScopeName = 5
-        name = 'g#2'
-
-        def Run():
-            sbc.LogicalCheck(d)
-            sbc.LogicalCheck(None)
-            sbc.RaiseIfNotLogical(d)
-            Raises(TypeError, sbc.RaiseIfNotLogical, 1)
-            sbc.IsWhitespaceLogical(d)
-            sbc.IsScopeStartLogical(c)
-            sbc.GetLocalScopeDefined(d)
-            sbc.GetLocalScopeDefined(c)
-            sbc.SetLogicalLocalScopeDefined(stored, name)
-            sbc.GetLocalScopeDefined(stored)
-            sbc.SetLogicalLocalScopeDefined(stored, None)
-            Raises(TypeError, sbc.GetLocalScopeDefined, wrong)
-            Raises(TypeError, sbc.SetLogicalLocalScopeDefined, 1, name)
-
-        self.assertFlat(Run, d, c, stored, wrong, name, d.fTokens[2], *d.fTokens)
-
-    def testSetAndNumberUtilities(self):
-        target = set([1, 2])
-        more = frozenset([2, 3])
-        huge = 2 ** 70
-
-        def Run():
-            sbc.PySet_InplaceOr(target, more)
-            Raises(TypeError, sbc.PySet_InplaceOr, None, more)
-            Raises(TypeError, sbc.PySet_InplaceOr, target, [4])
-            Raises(TypeError, sbc.PySet_InplaceOr, more, more)
-            sbc.GetNowTime()
-            sbc.OutOfTime(0.0)
-            bits = sbc.ULongLongValueForDoubleBits(1.5)
-            sbc.DoubleValueForULongLongBits(bits)
-            sbc.DoubleValueForPyIntBits(-1)
-            Raises(OverflowError, sbc.DoubleValueForULongLongBits, -1)
-            Raises(OverflowError, sbc.DoubleValueForPyIntBits, huge)
-            sbc.IsDefKind(70)
-            Raises(OverflowError, sbc.IsDefKind, 128)
-            sbc.GetInfoBytesKind(':x')
-            Raises(TypeError, sbc.GetInfoBytesKind, 5)
-            with CapturedStderr():
-                sbc.GetInfoBytesKind(None)
-
-        self.assertFlat(Run, target, more, huge, *target)
+for _case in [WholePass, IncrementalPass, OverridesAndReportedErrors, ScopeRenumbering,
+              ConstructionAndCycles, ErrorPaths, ModuleFunctions]:
+    setattr(LeakTest, 'test' + _case.__name__,
+            lambda self, case=_case: self.assertFlat(*case(), case=case.__name__))
 
 
 if __name__ == '__main__':

@@ -15,91 +15,65 @@ from pysource.scopebodycache import (
 from support import CapturedStderr, Logical, kBlankKind, kClassKind, kCommentKind, kDefKind
 
 
-class SubLogical(LogicalLineType):
-    pass
-
-
-class MySet(set):
-    pass
+SubLogical = type('SubLogical', (LogicalLineType,), {})
+MySet = type('MySet', (set,), {})
 
 
 def Bits(f):
     return struct.unpack('<Q', struct.pack('<d', f))[0]
 
 
-kNotLogicals = [None, 1, 'def f', ['def', 'f'], object(), SubLogical(['def', 'f'], 1, 0, 2)]
+def Outcome(func, *args):
+    try:
+        return func(*args)
+    except Exception as e:
+        return type(e), str(e)
 
 
-class LogicalTestsTest(unittest.TestCase):
+class LogicalTest(unittest.TestCase):
 
     def testOnlyTheExactTypeIsALogical(self):
+        sub = SubLogical(['def', 'f'], 1, 0, kDefKind)
         self.assertIs(LogicalCheck(Logical(['x'])), True)
-        for obj in kNotLogicals:
-            self.assertIs(LogicalCheck(obj), False)
-            with self.assertRaises(TypeError) as cm:
-                RaiseIfNotLogical(obj)
-            self.assertEqual(str(cm.exception), 'Argument must be a logical')
         self.assertIs(RaiseIfNotLogical(Logical(['x'])), False)
+        for obj in [None, 1, 'def f', ['def', 'f'], object(), sub]:
+            self.assertIs(LogicalCheck(obj), False)
+            for func, extra in [(RaiseIfNotLogical, ()), (IsWhitespaceLogical, ()),
+                                (IsScopeStartLogical, ()), (GetLocalScopeDefined, ()),
+                                (SetLogicalLocalScopeDefined, ('n',))]:
+                self.assertEqual(Outcome(func, obj, *extra),
+                                 (TypeError, 'Argument must be a logical'), (func, obj))
+        self.assertIsNone(sub.fLocalScopeName)
 
     def testKindTests(self):
-        for kind in range(0, 256, 1):
+        for kind in range(256):
             l = Logical(['x'], kind=kind)
             self.assertIs(IsWhitespaceLogical(l), kind in (kCommentKind, kBlankKind), kind)
             self.assertIs(IsScopeStartLogical(l), kind in (kClassKind, kDefKind), kind)
 
-    def testAccessorsRefuseNonLogicals(self):
-        for func, extra in [(IsWhitespaceLogical, ()), (IsScopeStartLogical, ()),
-                            (GetLocalScopeDefined, ()), (SetLogicalLocalScopeDefined, ('n',))]:
-            for obj in kNotLogicals:
-                with self.assertRaises(TypeError) as cm:
-                    func(obj, *extra)
-                self.assertEqual(str(cm.exception), 'Argument must be a logical')
-
-    def testSetOnANonLogicalWritesNothing(self):
-        sub = SubLogical(['def', 'f'], 1, 0, kDefKind)
-        self.assertRaises(TypeError, SetLogicalLocalScopeDefined, sub, 'g#0')
-        self.assertIsNone(sub.fLocalScopeName)
-
-
-class LocalScopeDefinedTest(unittest.TestCase):
-
-    def Defined(self, tokens, kind):
-        return GetLocalScopeDefined(Logical(tokens, kind=kind))
-
-    def testDefNames(self):
-        l = Logical(['def', 'f', '(', ')', ':'], kind=kDefKind)
-        self.assertIs(GetLocalScopeDefined(l), l.fTokens[1])
-        self.assertEqual(self.Defined(['async', 'def', 'g', '(', ')', ':'], kDefKind), 'g')
-        self.assertEqual(self.Defined(['\\', 'def', '\\\n', 'h', ':'], kDefKind), 'h')
-        self.assertEqual(self.Defined(['define', 'x'], kDefKind), 'define')
-        self.assertEqual(self.Defined(['async', 'async', 'def', 'k'], kDefKind), 'k')
-        self.assertIsNone(self.Defined(['def'], kDefKind))
-        self.assertIsNone(self.Defined(['async', 'def', '\\'], kDefKind))
-        self.assertIsNone(self.Defined([], kDefKind))
-
-    def testClassNames(self):
-        self.assertEqual(self.Defined(['class', 'A', '(', 'B', ')', ':'], kClassKind), 'A')
-        self.assertEqual(self.Defined(['\\x', 'class', 'B'], kClassKind), 'B')
-        # "async" is only skipped before a def.
-        self.assertEqual(self.Defined(['async', 'class', 'C'], kClassKind), 'async')
-        self.assertEqual(self.Defined(['classy'], kClassKind), 'classy')
-        self.assertEqual(self.Defined(['class', 'def', 'D'], kClassKind), 'def')
-        self.assertIsNone(self.Defined(['\\', 'class'], kClassKind))
-
-    def testTokensCompareUpToTheFirstNul(self):
-        self.assertEqual(self.Defined(['def\0x', 'f'], kDefKind), 'f')
-        self.assertEqual(self.Defined(['class\0', 'A'], kClassKind), 'A')
-        self.assertEqual(self.Defined(['de\0f', 'f'], kDefKind), 'de\0f')
-
-    def testOtherKindsDefineNothing(self):
-        for kind in [0, 3, kCommentKind, kBlankKind, 255]:
-            self.assertIsNone(self.Defined(['def', 'f'], kind))
-            self.assertIsNone(self.Defined(['class', 'A'], kind))
+    def testNameDefinedByTheTokens(self):
+        d, c = kDefKind, kClassKind
+        for tokens, kind, expected in [
+                (['def', 'f', '(', ')', ':'], d, 'f'), (['async', 'def', 'g', '('], d, 'g'),
+                (['\\', 'def', '\\\n', 'h', ':'], d, 'h'), (['define', 'x'], d, 'define'),
+                (['async', 'async', 'def', 'k'], d, 'k'), (['def'], d, None),
+                (['async', 'def', '\\'], d, None), ([], d, None),
+                (['class', 'A', '(', 'B', ')'], c, 'A'), (['\\x', 'class', 'B'], c, 'B'),
+                (['async', 'class', 'C'], c, 'async'),  # "async" is skipped before a def only
+                (['classy'], c, 'classy'), (['class', 'def', 'D'], c, 'def'),
+                (['\\', 'class'], c, None),
+                # Keywords compare up to the first NUL.
+                (['def\0x', 'f'], d, 'f'), (['class\0', 'A'], c, 'A'), (['de\0f', 'f'], d, 'de\0f'),
+                (['def', 'f'], 0, None), (['class', 'A'], kCommentKind, None),
+                (['def', 'f'], kBlankKind, None), (['class', 'A'], 255, None)]:
+            l = Logical(tokens, kind=kind)
+            self.assertEqual(GetLocalScopeDefined(l), expected, (tokens, kind))
+            if expected is not None:
+                self.assertIs(GetLocalScopeDefined(l), l.fTokens[tokens.index(expected)])
 
     def testStoredNameWins(self):
         for kind in [kDefKind, kClassKind, 0, kCommentKind]:
-            l = Logical(['def', 'f'], kind=kind)
-            name = 'g#3'
+            l, name = Logical(['def', 'f'], kind=kind), 'g#3'
             self.assertIsNone(SetLogicalLocalScopeDefined(l, name))
             self.assertIs(l.fLocalScopeName, name)
             self.assertIs(GetLocalScopeDefined(l), name)
@@ -109,187 +83,121 @@ class LocalScopeDefinedTest(unittest.TestCase):
         SetLogicalLocalScopeDefined(l, None)
         self.assertIsNone(l.fLocalScopeName)
         self.assertEqual(GetLocalScopeDefined(l), 'f')
-
-    def testStoredNameMustBeAStr(self):
         for value, type_name in [(5, 'int'), (u'f', 'unicode'), (bytearray('f'), 'bytearray')]:
             l = Logical(['def', 'f'], kind=kDefKind)
             SetLogicalLocalScopeDefined(l, value)
             self.assertIs(l.fLocalScopeName, value)
-            with self.assertRaises(TypeError) as cm:
-                GetLocalScopeDefined(l)
-            self.assertEqual(str(cm.exception), 'Expected bytes, got %s' % type_name)
+            self.assertEqual(Outcome(GetLocalScopeDefined, l),
+                             (TypeError, 'Expected bytes, got %s' % type_name))
 
 
-class SetInplaceOrTest(unittest.TestCase):
+class SmallFunctionsTest(unittest.TestCase):
 
-    def testReportsWhetherAnythingWasAdded(self):
+    def testSetInplaceOrReportsWhetherAnythingWasAdded(self):
         s = set([1, 2])
-        self.assertIs(PySet_InplaceOr(s, set([2, 3])), True)
-        self.assertEqual(s, set([1, 2, 3]))
-        self.assertIs(PySet_InplaceOr(s, frozenset([1, 3])), False)
-        self.assertIs(PySet_InplaceOr(s, set()), False)
-        self.assertIs(PySet_InplaceOr(s, MySet([4])), True)
+        for to_add, added, size in [(set([2, 3]), True, 3), (frozenset([1, 3]), False, 3),
+                                    (set(), False, 3), (MySet([4]), True, 4), (s, False, 4)]:
+            self.assertIs(PySet_InplaceOr(s, to_add), added, to_add)
+            self.assertEqual(len(s), size)
         self.assertEqual(s, set([1, 2, 3, 4]))
-        empty = set()
-        self.assertIs(PySet_InplaceOr(empty, empty), False)
 
-    def testSetObjectTypes(self):
-        with self.assertRaises(TypeError) as cm:
-            PySet_InplaceOr(None, set([1]))
-        self.assertEqual(str(cm.exception), "object of type 'NoneType' has no len()")
-        for obj, name in [(frozenset(), 'frozenset'), (MySet(), 'MySet'), ([], 'list')]:
-            with self.assertRaises(TypeError) as cm:
-                PySet_InplaceOr(obj, set([1]))
-            self.assertEqual(
-                str(cm.exception),
-                "Argument 'set_obj' has incorrect type (expected set, got %s)" % name)
+    def testSetInplaceOrErrors(self):
+        def Other(result):  # set |= x falls back to x.__ror__, whose result is checked
+            return type('Other', (object,), {'__ror__': lambda self, other: result})()
 
-    def testOperatorErrorsPropagate(self):
-        for to_add in [[1], None, (1,), 'ab']:
+        def OperatorError(to_add):
             try:
                 probe = set()
                 probe |= to_add
             except TypeError as e:
-                expected = str(e)
-            s = set([9])
-            with self.assertRaises(TypeError) as cm:
-                PySet_InplaceOr(s, to_add)
-            self.assertEqual(str(cm.exception), expected)
-            self.assertEqual(s, set([9]))
+                return TypeError, str(e)
 
-    def testOperatorResultMustBeASet(self):
-        # set |= x falls back to x.__ror__, whose result is then checked.
-        class Other(object):
-            def __init__(self, result):
-                self.result = result
+        def Wrong(name):
+            return TypeError, "Argument 'set_obj' has incorrect type (expected set, got %s)" % name
 
-            def __ror__(self, other):
-                return self.result
-
-        for result, name in [([1], 'list'), (frozenset([1, 2]), 'frozenset'),
-                             (MySet([1, 2]), 'MySet')]:
-            with self.assertRaises(TypeError) as cm:
-                PySet_InplaceOr(set([1]), Other(result))
-            self.assertEqual(str(cm.exception), 'Expected set, got %s' % name)
-        # A set result is measured against the original length.
+        for set_obj, to_add, expected in [
+                (None, set([1]), (TypeError, "object of type 'NoneType' has no len()")),
+                (frozenset(), set([1]), Wrong('frozenset')), (MySet(), set([1]), Wrong('MySet')),
+                ([], set([1]), Wrong('list'))] + [
+                (set([9]), x, OperatorError(x)) for x in [[1], None, (1,), 'ab']] + [
+                (set([9]), Other(r), (TypeError, 'Expected set, got ' + type(r).__name__))
+                for r in [[1], frozenset([1, 2]), MySet([1, 2])]]:
+            self.assertEqual(Outcome(PySet_InplaceOr, set_obj, to_add), expected, (set_obj, to_add))
+            if type(set_obj) is set:
+                self.assertEqual(set_obj, set([9]))
+        # A set result is measured against the original length, and not stored.
         s = set([1])
         self.assertIs(PySet_InplaceOr(s, Other(set([5, 6]))), True)
         self.assertIs(PySet_InplaceOr(s, Other(set([5]))), False)
         self.assertEqual(s, set([1]))
 
-
-class TimeTest(unittest.TestCase):
-
-    def testNowIsTheWallClock(self):
-        before = time.time()
-        now = GetNowTime()
-        after = time.time()
+    def testNowAndOutOfTime(self):
+        before, now, after = time.time(), GetNowTime(), time.time()
         self.assertIsInstance(now, float)
         self.assertTrue(before - 0.01 <= now <= after + 0.01, (before, now, after))
         self.assertLessEqual(now, GetNowTime())
-
-    def testOutOfTime(self):
-        self.assertIs(OutOfTime(0.0), True)
-        self.assertIs(OutOfTime(1e18), False)
-        self.assertIs(OutOfTime(time.time() - 1.0), True)
-        self.assertIs(OutOfTime(time.time() + 60.0), False)
-        # A time already reached counts as out of time.
-        self.assertIs(OutOfTime(GetNowTime()), True)
-        self.assertIs(OutOfTime(0), True)
-        self.assertIs(OutOfTime(float('-inf')), True)
-        self.assertIs(OutOfTime(float('inf')), False)
+        self.assertIs(OutOfTime(GetNowTime()), True)  # a time already reached counts
+        for end, out in [(0.0, True), (1e18, False), (time.time() - 1.0, True),
+                         (time.time() + 60.0, False), (0, True),
+                         (float('-inf'), True), (float('inf'), False)]:
+            self.assertIs(OutOfTime(end), out, end)
         self.assertRaises(TypeError, OutOfTime, 'soon')
         self.assertRaises(TypeError, OutOfTime, None)
 
-
-class BitsTest(unittest.TestCase):
-
-    kDoubles = [0.0, -0.0, 1.0, -2.5, 1e308, 5e-324, 2.2250738585072014e-308,
-                float('inf'), float('-inf'), math.pi]
-
-    def testDoubleToBits(self):
-        for f in self.kDoubles:
+    def testBits(self):
+        for f in [0.0, -0.0, 1.0, -2.5, 1e308, 5e-324, 2.2250738585072014e-308,
+                  float('inf'), float('-inf'), math.pi, 1]:
             bits = ULongLongValueForDoubleBits(f)
             self.assertIsInstance(bits, (int, long))
             self.assertEqual(bits, Bits(f), f)
-        self.assertEqual(ULongLongValueForDoubleBits(1), Bits(1.0))
-        self.assertEqual(ULongLongValueForDoubleBits(-0.0), 1 << 63)
-        self.assertRaises(TypeError, ULongLongValueForDoubleBits, '1.0')
-
-    def testBitsToDouble(self):
-        for n in [0, 1, 0x3ff0000000000000, 1 << 63, 0x7ff0000000000000, 2 ** 64 - 1,
-                  0x7ff8000000000001]:
+            self.assertEqual(Bits(DoubleValueForULongLongBits(bits)), Bits(f), f)
+            signed = struct.unpack('<q', struct.pack('<d', f))[0]
+            self.assertEqual(Bits(DoubleValueForPyIntBits(signed)), Bits(f), f)
+        for n in [0, 1, 1 << 63, 0x7ff0000000000000, 2 ** 64 - 1, 0x7ff8000000000001]:
             f = DoubleValueForULongLongBits(n)
             self.assertIsInstance(f, float)
             self.assertEqual(ULongLongValueForDoubleBits(f), n, hex(n))
         self.assertEqual(DoubleValueForULongLongBits(0x3ff0000000000000), 1.0)
-        self.assertRaises(OverflowError, DoubleValueForULongLongBits, -1)
-        self.assertRaises(OverflowError, DoubleValueForULongLongBits, 2 ** 64)
-        self.assertRaises(TypeError, DoubleValueForULongLongBits, 1.0)
-
-    def testRoundTrips(self):
-        for f in self.kDoubles:
-            back = DoubleValueForULongLongBits(ULongLongValueForDoubleBits(f))
-            self.assertEqual(Bits(back), Bits(f))
-            back = DoubleValueForPyIntBits(struct.unpack('<q', struct.pack('<d', f))[0])
-            self.assertEqual(Bits(back), Bits(f))
-
-    def testSignedBitsAreSignExtended(self):
-        nan = DoubleValueForPyIntBits(-1)
-        self.assertTrue(math.isnan(nan))
-        self.assertEqual(ULongLongValueForDoubleBits(nan), 2 ** 64 - 1)
-        smallest = DoubleValueForPyIntBits(-2 ** 63)
-        self.assertEqual(smallest, 0.0)
-        self.assertEqual(math.copysign(1.0, smallest), -1.0)
         self.assertEqual(DoubleValueForPyIntBits(0x3ff0000000000000), 1.0)
+        # Signed bits are sign-extended.
+        self.assertTrue(math.isnan(DoubleValueForPyIntBits(-1)))
+        self.assertEqual(ULongLongValueForDoubleBits(DoubleValueForPyIntBits(-1)), 2 ** 64 - 1)
+        self.assertEqual(Bits(DoubleValueForPyIntBits(-2 ** 63)), 1 << 63)
         self.assertEqual(Bits(DoubleValueForPyIntBits(-2)), 2 ** 64 - 2)
-        self.assertRaises(OverflowError, DoubleValueForPyIntBits, 2 ** 63)
-        self.assertRaises(OverflowError, DoubleValueForPyIntBits, -2 ** 63 - 1)
-
-
-class SymbolKindsTest(unittest.TestCase):
+        for func, arg, exc in [
+                (ULongLongValueForDoubleBits, '1.0', TypeError),
+                (DoubleValueForULongLongBits, 1.0, TypeError),
+                (DoubleValueForULongLongBits, -1, OverflowError),
+                (DoubleValueForULongLongBits, 2 ** 64, OverflowError),
+                (DoubleValueForPyIntBits, 2 ** 63, OverflowError),
+                (DoubleValueForPyIntBits, -2 ** 63 - 1, OverflowError)]:
+            self.assertRaises(exc, func, arg)
 
     def testDefKinds(self):
         kinds = [symbolinfo.kFunctionKind, symbolinfo.kMethodKind, symbolinfo.kUnboundMethodKind]
-        for kind in kinds:
-            self.assertIsInstance(kind, int)
-            self.assertIs(IsDefKind(kind), True)
+        self.assertNotIn(symbolinfo.kClassKind, kinds)
         for kind in range(-128, 128):
             self.assertIs(IsDefKind(kind), kind in kinds, kind)
-        self.assertIs(IsDefKind(symbolinfo.kClassKind), False)
-
-    def testKindOutsideTheCharRange(self):
         for kind in [128, -129, 2 ** 40]:
-            with self.assertRaises(OverflowError) as cm:
-                IsDefKind(kind)
-            self.assertEqual(str(cm.exception), 'value too large to convert to char')
+            self.assertEqual(Outcome(IsDefKind, kind),
+                             (OverflowError, 'value too large to convert to char'))
         self.assertRaises(TypeError, IsDefKind, 'F')
         self.assertRaises(TypeError, IsDefKind, None)
 
     def testInfoBytesKind(self):
         plain = symbolinfo.kPlainEquivKind
-        for ibytes in ['', 'x', ':', 'ab', 'x:y', '::'[:1]]:
-            self.assertEqual(GetInfoBytesKind(ibytes), plain, repr(ibytes))
-        self.assertEqual(GetInfoBytesKind(':x'), ord('x'))
-        self.assertEqual(GetInfoBytesKind(':Fname'), ord('F'))
-        self.assertEqual(GetInfoBytesKind('::'), ord(':'))
-        self.assertEqual(GetInfoBytesKind(':\xff'), -1)
-        self.assertEqual(GetInfoBytesKind(':\x80rest'), -128)
-        self.assertEqual(GetInfoBytesKind(':\0'), 0)
-
-    def testInfoBytesKindOfNoneIsReported(self):
+        wrong = "Argument 'ibytes' has incorrect type (expected str, got %s)"
+        for ibytes, expected in [
+                ('', plain), ('x', plain), (':', plain), ('ab', plain), ('x:y', plain),
+                (':x', ord('x')), (':Fname', ord('F')), ('::', ord(':')), (':\xff', -1),
+                (':\x80rest', -128), (':\0', 0), (5, (TypeError, wrong % 'int')),
+                (u':x', (TypeError, wrong % 'unicode')),
+                (bytearray(':x'), (TypeError, wrong % 'bytearray'))]:
+            self.assertEqual(Outcome(GetInfoBytesKind, ibytes), expected, repr(ibytes))
         with CapturedStderr() as err:
             self.assertEqual(GetInfoBytesKind(None), 0)
         self.assertIn('pysource.symbolinfo.GetInfoBytesKind', err.getvalue())
         self.assertIn('TypeError', err.getvalue())
-
-    def testInfoBytesKindArgumentType(self):
-        for ibytes, name in [(5, 'int'), (u':x', 'unicode'), (bytearray(':x'), 'bytearray')]:
-            with self.assertRaises(TypeError) as cm:
-                GetInfoBytesKind(ibytes)
-            self.assertEqual(
-                str(cm.exception),
-                "Argument 'ibytes' has incorrect type (expected str, got %s)" % name)
 
 
 if __name__ == '__main__':

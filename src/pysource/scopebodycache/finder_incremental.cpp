@@ -124,7 +124,13 @@ void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t 
         changed = true;
     }
     py::Ref previousLocal = py::Ref::none();
-    if (isScopeStart(logical) && localScopeDefined(logical) != nullptr) {
+    // A kept class/def whose containing scope is unchanged keeps its index
+    // as long as no definition was added, removed or renamed so far in this
+    // call; skipping the count spares a walk of the list from the top.
+    const bool indexUnchanged = !changed && logical->fLocalScopeName != nullptr &&
+                                !nonEmptySet(finderState(self).classChanges) &&
+                                !nonEmptySet(finderState(self).functionChanges);
+    if (isScopeStart(logical) && localScopeDefined(logical) != nullptr && !indexUnchanged) {
         const Py_ssize_t index = route::FindScopeIndexForLogical(self, logicalObj, i);
         py::Ref newLocal = route::GetLeafScopeWithIndex(self, logicalObj, index);
         previousLocal = py::Ref::own(localScopeDefined(logical));
