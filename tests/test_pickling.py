@@ -1,11 +1,10 @@
-"""Tests of pickling and copying CChangeFinder and CScopeBodyCache."""
+"""Pickling and copying CChangeFinder and CScopeBodyCache."""
 
 import copy
 import cPickle
 import gc
 import pickle
 import sys
-import textwrap
 import unittest
 
 from pysource import scopebodycache
@@ -23,6 +22,10 @@ kFinderFields = ('(__fDestroyed, __fSignalCatchers, _fCurrentClassChanges, _fCur
                  '_fLogicalList, _fNextChangeIndex, _fScopesSeen)')
 kCacheFields = '(__fDestroyed, __fSignalCatchers, _fLogicalList, _fScopeBodyCache, _fScopeDefCache)'
 
+kGoodFinderState = (False, None, set(), set(), set(), 0, -1, [], -1, {})
+kGoodCacheState = (True, None, None, None, None)
+kFullFinderState = (True, {}, set(['x']), set(), set(), 3, 4, [], 5, {})
+
 kSource = """\
 class A:
     def f(self):
@@ -36,7 +39,7 @@ def g():
 
 
 def Named(source=kSource):
-    lst = ReadLogicals(textwrap.dedent(source))
+    lst = ReadLogicals(source)
     CChangeFinder(lst).FindChanges(lst, [])
     return lst
 
@@ -65,21 +68,17 @@ def Plain(value):
     return value
 
 
-def FinderFields(cf):
-    return Plain((cf.IsDestroyed(), getattr(cf, '__fSignalCatchers'), cf.__reduce__()[-1][2:10]))
+def Fields(obj):
+    if isinstance(obj, CChangeFinder):
+        return Plain((obj.IsDestroyed(), getattr(obj, '__fSignalCatchers'), obj.__reduce__()[-1][2:10]))
+    return Plain((obj.IsDestroyed(), getattr(obj, '__fSignalCatchers'), obj._fLogicalList,
+                  obj._fScopeBodyCache, obj._fScopeDefCache))
 
 
-def CacheFields(c):
-    return Plain((c.IsDestroyed(), getattr(c, '__fSignalCatchers'), c._fLogicalList, c._fScopeBodyCache,
-                  c._fScopeDefCache))
-
-
-class SubFinder(CChangeFinder):
-    pass
-
-
-class SubCache(CScopeBodyCache):
-    pass
+SubFinder = type('SubFinder', (CChangeFinder,), {})
+SubCache = type('SubCache', (CScopeBodyCache,), {})
+SlottedCache = type('SlottedCache', (CScopeBodyCache,), {'__slots__': ()})
+SubDict = type('SubDict', (dict,), {})
 
 
 class SnapshotFinder(CChangeFinder):
@@ -88,10 +87,6 @@ class SnapshotFinder(CChangeFinder):
     def _FindChangesEntireListAdded(self):
         self.during = pickle.dumps(self, 2)
         return CChangeFinder._FindChangesEntireListAdded(self)
-
-
-class SlottedCache(CScopeBodyCache):
-    __slots__ = ()
 
 
 class RoundTripTest(unittest.TestCase):
@@ -108,277 +103,198 @@ class RoundTripTest(unittest.TestCase):
         setattr(signals, '__fSignalCatchers', {'sig': [1]})
         sub = SubCache(lst)
         sub.note = 'kept'
-        return [CChangeFinder(lst), idle, cache, destroyed, signals, sub, SubFinder(None),
-                CChangeFinder.__new__(CChangeFinder), CScopeBodyCache.__new__(SubCache),
-                SlottedCache(None)]
+        mid = SnapshotFinder(ReadLogicals(kSource))
+        mid.FindChanges(mid._fLogicalList, [])
+        return [CChangeFinder(lst), idle, cache, destroyed, signals, sub, SubFinder(None), mid,
+                pickle.loads(mid.during), CChangeFinder.__new__(CChangeFinder),
+                CScopeBodyCache.__new__(SubCache), SlottedCache(None)]
 
-    def assertSame(self, a, b):
-        self.assertIs(type(a), type(b))
-        fields = FinderFields if isinstance(a, CChangeFinder) else CacheFields
-        self.assertEqual(fields(a), fields(b))
-        self.assertEqual(getattr(a, '__dict__', None), getattr(b, '__dict__', None))
-
-    def testPicklers(self):
-        for label, dumps, loads in Picklers():
+    def testPicklesAndCopies(self):
+        same = lambda o: o  # noqa: E731
+        routes = list(Picklers()) + [('copy', copy.copy, same), ('deepcopy', copy.deepcopy, same)]
+        for label, dumps, loads in routes:
             for obj in self.Objects():
-                self.assertSame(loads(dumps(obj)), obj)
+                clone = loads(dumps(obj))
+                self.assertIs(type(clone), type(obj), label)
+                self.assertEqual(Fields(clone), Fields(obj), (label, obj))
+                self.assertEqual(getattr(clone, '__dict__', None), getattr(obj, '__dict__', None), label)
+                for name in ('_fLogicalList', '_fScopeBodyCache'):
+                    if label.endswith('copy') and getattr(obj, name, None):
+                        self.assertEqual(getattr(clone, name) is getattr(obj, name), label == 'copy')
 
-    def testCopies(self):
-        for obj in self.Objects():
-            shallow = copy.copy(obj)
-            self.assertSame(shallow, obj)
-            deep = copy.deepcopy(obj)
-            self.assertSame(deep, obj)
-            for name in ('_fLogicalList', '_fScopeBodyCache'):
-                if getattr(obj, name, None):
-                    self.assertIs(getattr(shallow, name), getattr(obj, name))
-                    self.assertIsNot(getattr(deep, name), getattr(obj, name))
-
-    def testCacheKeepsServingSharedLogicals(self):
+    def testRestoredObjectsKeepWorkingOnTheirList(self):
         lst = Named()
-        cache = CScopeBodyCache(lst)
+        cf, cache = CChangeFinder(lst), CScopeBodyCache(lst)
+        cf.FindChanges(lst, [])
         body = cache.GetBodyOfScope('A#0')
+        expected = Named(kSource.replace('    def f(self):\n        return 1\n', ''))
         for label, dumps, loads in Picklers():
-            lst2, cache2 = loads(dumps((lst, cache)))
-            self.assertIs(cache2._fLogicalList, lst2)
+            lst2, cache2, cf2 = loads(dumps((lst, cache, cf)))
+            self.assertIs(cache2._fLogicalList, lst2, label)
+            self.assertIs(cf2._fLogicalList, lst2, label)
+            self.assertEqual(Names(lst2), Names(lst))
             self.assertEqual(Names(cache2.GetBodyOfScope('A#0')), Names(body))
             self.assertIs(cache2.GetBodyOfScope('A#0')[0], lst2[1])
             self.assertIs(cache2.GetScopeDef('A#0.f#1'), lst2[3])
-
-    def testFinderKeepsWorkingOnRestoredList(self):
-        lst = Named()
-        cf = CChangeFinder(lst)
-        cf.FindChanges(lst, [])
-        for label, dumps, loads in Picklers():
-            cf2, lst2 = loads(dumps((cf, lst)))
-            self.assertIs(cf2._fLogicalList, lst2)
-            self.assertEqual(Names(lst2), Names(lst))
-            # Delete the first `def f` with its body: the second becomes f#0.
-            removed = lst2[1:3]
+            removed = lst2[1:3]  # the first `def f`: the second becomes f#0
             del lst2[1:3]
             contents, classes, functions = cf2.FindChanges([], removed)
             self.assertIn('A#0', contents)
             self.assertEqual(functions, set(['A#0.f#0', 'A#0.f#1']))
-            fresh = ReadLogicals(textwrap.dedent(kSource))
-            del fresh[1:3]
-            CChangeFinder(fresh).FindChanges(fresh, [])
-            self.assertEqual([n[1:] for n in Names(lst2)], [n[1:] for n in Names(fresh)], label)
-
-
-class ReduceFormTest(unittest.TestCase):
-
-    def testFreshFinderUsesSetstateForm(self):
-        lst = Named()
-        cf = CChangeFinder(lst)
-        self.assertEqual(cf.__reduce__(),
-                         (UnpickleFinder, (CChangeFinder, kFinderSum, None),
-                          (False, None, None, None, None, 0, -1, lst, -1, None)))
-
-    def testAllNoneUsesInlineForm(self):
-        for cls, fn, checksum, state in [
-                (CChangeFinder, UnpickleFinder, kFinderSum,
-                 (False, None, None, None, None, 0, 0, None, 0, None)),
-                (CScopeBodyCache, UnpickleCache, kCacheSum,
-                 (False, None, None, None, None))]:
-            self.assertEqual(cls.__new__(cls).__reduce__(), (fn, (cls, checksum, state)))
-
-    def testDestroyedFlagAndDicts(self):
-        c = CScopeBodyCache(None)
-        c.destroy()
-        self.assertEqual(c.__reduce__()[1][2], (True, None, None, None, None))
-        reduced = SubCache(None).__reduce__()
-        self.assertEqual(reduced[1], (SubCache, kCacheSum, None))
-        self.assertEqual(reduced[2], (False, None, None, {}, {}, {}))
-        slotted = SlottedCache.__new__(SlottedCache)
-        self.assertEqual(len(slotted.__reduce__()), 2)
-
-    def testRebuildFunctionLookedUpAtEachReduce(self):
-        marker = lambda *args: None  # noqa: E731
-        name = '__pyx_unpickle_CScopeBodyCache'
-        saved = getattr(scopebodycache, name)
-        setattr(scopebodycache, name, marker)
-        try:
-            self.assertIs(CScopeBodyCache(None).__reduce__()[0], marker)
-        finally:
-            setattr(scopebodycache, name, saved)
-        self.assertIs(CScopeBodyCache(None).__reduce__()[0], saved)
-
-    def testPickleRefersToFunctionsByName(self):
-        for fn in (UnpickleFinder, UnpickleCache):
-            self.assertEqual(fn.__module__, 'pysource.scopebodycache')
-            self.assertIs(pickle.loads(pickle.dumps(fn)), fn)
-        data = pickle.dumps(CChangeFinder(None), 0)
-        self.assertIn('pysource.scopebodycache\n__pyx_unpickle_CChangeFinder', data)
-
-    def testInstalledHooks(self):
-        for cls in (CChangeFinder, CScopeBodyCache):
-            self.assertIn('__reduce__', cls.__dict__)
-            self.assertIn('__setstate__', cls.__dict__)
-            self.assertNotIn('__reduce_ex__', cls.__dict__)
-            self.assertFalse(hasattr(cls, '__getstate__'))
-            self.assertEqual(cls.__reduce__.__module__, 'pysource.scopebodycache')
-
-
-class MidFindChangesTest(unittest.TestCase):
+            self.assertEqual([n[1:] for n in Names(lst2)], [n[1:] for n in Names(expected)], label)
 
     def testPickledDuringFindChanges(self):
         lst = ReadLogicals(kSource)
         cf = SnapshotFinder(lst)
         cf.FindChanges(lst, [])
         loaded = pickle.loads(cf.during)
-        self.assertIs(type(loaded), SnapshotFinder)
         self.assertEqual(loaded.__dict__.keys(), [])  # taken before `during` was set
         state = loaded.__reduce__()[2]
-        self.assertEqual(state[3], set())  # contents changes: a call in progress
+        self.assertEqual(state[2:5], (set(), set(), set()))  # a call in progress
         self.assertIsInstance(state[9], dict)
-        self.assertEqual(state[2:5], (set(), set(), set()))
         self.assertEqual(Names(loaded._fLogicalList), [(l.fLineno, None, None) for l in lst])
         with self.assertRaises(ValueError) as cm:
             loaded.FindChanges([], [])
         self.assertEqual(str(cm.exception), 'FindChanges cannot be called recursively')
         loaded._Clear()
-        lst2 = loaded._fLogicalList
-        loaded.FindChanges(lst2, [])
-        self.assertEqual(Names(lst2), Names(Named()))
+        loaded.FindChanges(loaded._fLogicalList, [])
+        self.assertEqual(Names(loaded._fLogicalList), Names(Named()))
 
-    def testIndicesCarried(self):
-        cf = CChangeFinder(None)
+
+class ReduceFormTest(unittest.TestCase):
+
+    def testSetstateAndInlineForms(self):
+        lst = Named()
+        self.assertEqual(CChangeFinder(lst).__reduce__(),
+                         (UnpickleFinder, (CChangeFinder, kFinderSum, None),
+                          (False, None, None, None, None, 0, -1, lst, -1, None)))
+        self.assertEqual(CChangeFinder.__new__(CChangeFinder).__reduce__(),
+                         (UnpickleFinder, (CChangeFinder, kFinderSum,
+                                           (False, None, None, None, None, 0, 0, None, 0, None))))
+        self.assertEqual(CScopeBodyCache.__new__(CScopeBodyCache).__reduce__(),
+                         (UnpickleCache, (CScopeBodyCache, kCacheSum, (False, None, None, None, None))))
+        c = CScopeBodyCache(None)
+        c.destroy()
+        self.assertEqual(c.__reduce__()[1][2], (True, None, None, None, None))
+        self.assertEqual(SubCache(None).__reduce__()[1:],
+                         ((SubCache, kCacheSum, None), (False, None, None, {}, {}, {})))
+        self.assertEqual(len(SlottedCache.__new__(SlottedCache).__reduce__()), 2)
+        self.assertEqual(CScopeBodyCache.__new__(SubCache).__reduce__()[1:],
+                         ((SubCache, kCacheSum, None), (False, None, None, None, None, {})))
         state = (False, None, set(['a']), set(), set(), 7, 5, [], 9, {'k': 1})
+        cf = CChangeFinder(None)
         cf.__setstate__(state)
         self.assertEqual(cf.__reduce__()[2], state)
+
+    def testRebuildFunctionsByNameLookedUpAtEachReduce(self):
+        for fn in (UnpickleFinder, UnpickleCache):
+            self.assertIs(pickle.loads(pickle.dumps(fn)), fn)
+        self.assertIn('pysource.scopebodycache\n__pyx_unpickle_CChangeFinder',
+                      pickle.dumps(CChangeFinder(None), 0))
+        marker = lambda *args: None  # noqa: E731
+        setattr(scopebodycache, '__pyx_unpickle_CScopeBodyCache', marker)
+        try:
+            self.assertIs(CScopeBodyCache(None).__reduce__()[0], marker)
+        finally:
+            setattr(scopebodycache, '__pyx_unpickle_CScopeBodyCache', UnpickleCache)
+        self.assertIs(CScopeBodyCache(None).__reduce__()[0], UnpickleCache)
+        for cls in (CChangeFinder, CScopeBodyCache):
+            self.assertNotIn('__reduce_ex__', cls.__dict__)
+            self.assertFalse(hasattr(cls, '__getstate__'))
 
 
 class RefusedTest(unittest.TestCase):
 
-    def assertRaisesMessage(self, exc, message, fn, *args, **kwargs):
+    def Fails(self, exc, message, fn, *args, **kwargs):
         with self.assertRaises(exc) as cm:
             fn(*args, **kwargs)
-        self.assertEqual(str(cm.exception), message)
+        if message is not None:
+            self.assertEqual(str(cm.exception), message)
 
-    def testWrongChecksum(self):
-        self.assertRaisesMessage(
-            pickle.PickleError, 'Incompatible checksums (%d vs 0x093a2af = %s)' % (kCacheSum, kFinderFields),
-            UnpickleFinder, CChangeFinder, kCacheSum, None)
-        # A change finder's pickle handed to the other rebuild function.
-        args = CChangeFinder(None).__reduce__()[1]
-        self.assertRaisesMessage(
-            pickle.PickleError, 'Incompatible checksums (9675439 vs 0xa66c71f = %s)' % kCacheFields,
-            UnpickleCache, *args)
-        self.assertRaisesMessage(
-            pickle.PickleError, 'Incompatible checksums (-1 vs 0xa66c71f = %s)' % kCacheFields,
-            UnpickleCache, CScopeBodyCache, -1, None)
-        self.assertRaises(TypeError, UnpickleCache, CScopeBodyCache, float(kCacheSum), None)
+    def testRebuildAndSetstateArguments(self):
+        checksums = 'Incompatible checksums (%s vs %s = %s)'
+        self.Fails(pickle.PickleError, checksums % (kCacheSum, '0x093a2af', kFinderFields),
+                   UnpickleFinder, CChangeFinder, kCacheSum, None)
+        self.Fails(pickle.PickleError, checksums % (9675439, '0xa66c71f', kCacheFields),
+                   UnpickleCache, *CChangeFinder(None).__reduce__()[1])
+        self.Fails(pickle.PickleError, checksums % (-1, '0xa66c71f', kCacheFields),
+                   UnpickleCache, CScopeBodyCache, -1, None)
         data = pickle.dumps(CScopeBodyCache(None), 2).replace('\x1f\xc7\x66\x0a', '\x20\xc7\x66\x0a')
-        self.assertRaises(pickle.PickleError, pickle.loads, data)
-
-    def testRebuildArguments(self):
-        obj = UnpickleCache(__pyx_state=None, __pyx_checksum=kCacheSum, __pyx_type=SubCache)
-        self.assertIs(type(obj), SubCache)
-        self.assertEqual(CacheFields(obj), (False, None, None, None, None))
-        self.assertRaises(TypeError, UnpickleCache, CChangeFinder, kCacheSum, None)
-        self.assertRaises(TypeError, UnpickleCache, 5, kCacheSum, None)
-        self.assertRaisesMessage(
-            TypeError, '__pyx_unpickle_CChangeFinder() takes exactly 3 positional arguments (2 given)',
-            UnpickleFinder, CChangeFinder, kFinderSum)
-        self.assertRaisesMessage(TypeError, 'Expected tuple, got list', UnpickleCache,
-                                 CScopeBodyCache, kCacheSum, [False, None, None, None, None])
-
-    def testSetstateArguments(self):
+        self.Fails(pickle.PickleError, None, pickle.loads, data)
+        for cls, checksum in [(CScopeBodyCache, float(kCacheSum)), (CChangeFinder, kCacheSum), (5, kCacheSum)]:
+            self.Fails(TypeError, None, UnpickleCache, cls, checksum, None)
+        self.Fails(TypeError, '__pyx_unpickle_CChangeFinder() takes exactly 3 positional arguments (2 given)',
+                   UnpickleFinder, CChangeFinder, kFinderSum)
+        self.Fails(TypeError, 'Expected tuple, got list',
+                   UnpickleCache, CScopeBodyCache, kCacheSum, [False, None, None, None, None])
+        self.Fails(IndexError, 'tuple index out of range',
+                   UnpickleCache, CScopeBodyCache, kCacheSum, (False, None, None, None))
         c = CScopeBodyCache(None)
-        self.assertRaisesMessage(TypeError, "'NoneType' object is not subscriptable", c.__setstate__, None)
-        self.assertRaisesMessage(TypeError, 'Expected tuple, got list', c.__setstate__, [])
-        self.assertRaisesMessage(TypeError, '__setstate__() takes no keyword arguments',
-                                 c.__setstate__, __pyx_state=())
-        self.assertRaisesMessage(TypeError, '__reduce__() takes no arguments (1 given)', c.__reduce__, 2)
-        self.assertRaises(TypeError, CScopeBodyCache.__dict__['__reduce__'], CChangeFinder(None))
-        self.assertRaises(TypeError, CChangeFinder.__dict__['__setstate__'], CScopeBodyCache(None), ())
+        self.Fails(TypeError, "'NoneType' object is not subscriptable", c.__setstate__, None)
+        self.Fails(TypeError, 'Expected tuple, got list', c.__setstate__, [])
+        self.Fails(TypeError, '__setstate__() takes no keyword arguments', c.__setstate__, __pyx_state=())
+        self.Fails(TypeError, '__reduce__() takes no arguments (1 given)', c.__reduce__, 2)
+        self.Fails(TypeError, None, CScopeBodyCache.__dict__['__reduce__'], CChangeFinder(None))
+        self.Fails(TypeError, None, CChangeFinder.__dict__['__setstate__'], c, ())
+        self.Fails(ValueError, None, SubCache(None).__setstate__, (False, None, None, None, None, 'no'))
 
     def testWrongTypeAtEachItem(self):
-        class SubDict(dict):
-            pass
-        good = [False, None, set(), set(), set(), 0, -1, [], -1, {}]
-        for i, bad, expected in [(1, [], 'dict'), (1, SubDict(), 'dict'), (2, [], 'set'),
-                                 (3, frozenset(), 'set'), (4, {}, 'set'), (7, (), 'list'),
-                                 (9, set(), 'dict')]:
+        for good, i, bad, expected in [
+                (kGoodFinderState, 1, [], 'dict'), (kGoodFinderState, 1, SubDict(), 'dict'),
+                (kGoodFinderState, 2, [], 'set'), (kGoodFinderState, 3, frozenset(), 'set'),
+                (kGoodFinderState, 4, {}, 'set'), (kGoodFinderState, 7, (), 'list'),
+                (kGoodFinderState, 9, set(), 'dict'), (kGoodCacheState, 1, set(), 'dict'),
+                (kGoodCacheState, 2, (), 'list'), (kGoodCacheState, 3, [], 'dict'),
+                (kGoodCacheState, 4, SubDict(), 'dict')] + [
+                (kGoodFinderState, i, bad, None) for i in (5, 6, 8) for bad in (1.5, 2 ** 80)]:
             state = list(good)
             state[i] = bad
-            self.assertRaisesMessage(TypeError, 'Expected %s, got %s' % (expected, type(bad).__name__),
-                                     CChangeFinder(None).__setstate__, tuple(state))
-        for i in (5, 6, 8):
-            state = list(good)
-            state[i] = 1.5
-            self.assertRaises(TypeError, CChangeFinder(None).__setstate__, tuple(state))
-            state[i] = 2 ** 80
-            self.assertRaises(OverflowError, CChangeFinder(None).__setstate__, tuple(state))
-        for i, bad, expected in [(1, set(), 'dict'), (2, (), 'list'), (3, [], 'dict'), (4, SubDict(), 'dict')]:
-            state = [True, None, None, None, None]
-            state[i] = bad
-            self.assertRaisesMessage(TypeError, 'Expected %s, got %s' % (expected, type(bad).__name__),
-                                     CScopeBodyCache(None).__setstate__, tuple(state))
+            obj = (CChangeFinder if good is kGoodFinderState else CScopeBodyCache)(None)
+            self.Fails(OverflowError if bad == 2 ** 80 else TypeError,
+                       expected and 'Expected %s, got %s' % (expected, type(bad).__name__),
+                       obj.__setstate__, tuple(state))
 
-    def testFailureKeepsEarlierFields(self):
-        c = CScopeBodyCache([])
-        lst = []
-        with self.assertRaises(TypeError):
-            c.__setstate__((1, {'s': 1}, lst, 'bad', {}))
-        self.assertEqual(CacheFields(c), (True, {'s': 1}, lst, {}, {}))
+    def testPartialStates(self):
+        obj = UnpickleCache(__pyx_state=None, __pyx_checksum=kCacheSum, __pyx_type=SubCache)
+        self.assertEqual((type(obj), Fields(obj)), (SubCache, (False, None, None, None, None)))
+        c, lst = CScopeBodyCache([]), []
+        self.assertRaises(TypeError, c.__setstate__, (1, {'s': 1}, lst, 'bad', {}))
+        self.assertEqual(Fields(c), (True, {'s': 1}, lst, {}, {}))  # earlier fields kept
         self.assertIs(c._fLogicalList, lst)
-
-    def testShortTuples(self):
         for n in range(10):
             cf = CChangeFinder(None)
-            state = (True, {}, set(['x']), set(), set(), 3, 4, [], 5, {})[:n]
-            self.assertRaisesMessage(IndexError, 'tuple index out of range', cf.__setstate__, state)
+            self.Fails(IndexError, 'tuple index out of range', cf.__setstate__, kFullFinderState[:n])
             self.assertEqual(cf.IsDestroyed(), n > 0)
-        self.assertRaisesMessage(IndexError, 'tuple index out of range', UnpickleCache,
-                                 CScopeBodyCache, kCacheSum, (False, None, None, None))
-
-    def testTruthOfDestroyedFlag(self):
-        class Falsy(object):
-            def __nonzero__(self):
-                return False
-        c = CScopeBodyCache(None)
-        c.__setstate__(([1], None, None, None, None))
-        self.assertTrue(c.IsDestroyed())
-        c.__setstate__((Falsy(), None, None, None, None))
-        self.assertFalse(c.IsDestroyed())
-
-    def testExtraItems(self):
-        c = CScopeBodyCache(None)
+        falsy = type('Falsy', (object,), {'__nonzero__': lambda s: False})()
+        for flag, destroyed in [([1], True), (falsy, False)]:
+            c.__setstate__((flag, None, None, None, None))
+            self.assertEqual(c.IsDestroyed(), destroyed)
         c.__setstate__((False, None, None, None, None, {'x': 1}, 'ignored'))  # no __dict__: ignored
         sub = SubCache(None)
         sub.__setstate__((False, None, None, None, None, {'x': 1}, 'ignored'))
         self.assertEqual(sub.x, 1)
-        self.assertRaises(ValueError, SubCache(None).__setstate__, (False, None, None, None, None, 'no'))
 
 
 class LeakTest(unittest.TestCase):
 
     def testReduceAndRebuildFlat(self):
         lst = Named()
-        cf = CChangeFinder(lst)
-        cache = SubCache(lst)
+        cf, cache = CChangeFinder(lst), SubCache(lst)
         cache.GetBodyOfScope('A#0')
+        cache.note = [1]
         bad = (False, None, None, 'x', None)
 
         def Run():
             for obj in (cf, cache):
                 copy.copy(obj)
                 cPickle.loads(cPickle.dumps(obj, 2))
-            try:
-                CScopeBodyCache(None).__setstate__(bad)
-            except TypeError:
-                pass
-            try:
-                UnpickleFinder(CChangeFinder, 1, None)
-            except pickle.PickleError:
-                pass
+            self.assertRaises(TypeError, CScopeBodyCache(None).__setstate__, bad)
+            self.assertRaises(pickle.PickleError, UnpickleFinder, CChangeFinder, 1, None)
         for _ in range(5):
             Run()
         gc.collect()
-        watched = [lst, cf, cache, bad, CScopeBodyCache, SubCache] + lst
-        counts = [sys.getrefcount(w) for w in watched]
-        objects = len(gc.get_objects())
+        watched = [lst, cf, cache, cache.__dict__, bad, CScopeBodyCache, SubCache] + lst
+        counts, objects = [sys.getrefcount(w) for w in watched], len(gc.get_objects())
         for _ in range(200):
             Run()
         gc.collect()

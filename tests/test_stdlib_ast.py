@@ -1,59 +1,40 @@
-"""The whole-file pass against the `ast` module, on the standard library and
+"""The whole-file pass against the `ast` module: on the standard library and
 on small sources that pin down each naming rule."""
 
 import ast
 import os
 import sys
-import textwrap
 import unittest
-from cStringIO import StringIO
+from textwrap import dedent as D
 
-_kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
-sys.path.insert(0, os.path.join(_kRepoDir, 'tools'))
-
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
 import crosscheck_ast  # noqa: E402
 from pysource._fastaccess import LogicalLineType  # noqa: E402
 from pysource.logicals import ReadLogicals  # noqa: E402
 from pysource.scopebodycache import CChangeFinder  # noqa: E402
 
-kSanitized = bool(os.environ.get('SBC_SANITIZED'))
+SANITIZED = bool(os.environ.get('SBC_SANITIZED'))
 kBigFiles = ['decimal.py', 'inspect.py', 'pydoc.py', os.path.join('test', 'test_descr.py')]
 
 
-def StdlibSample():
-    """A fixed sample: every Nth file of the sorted library plus some big ones."""
-    root = crosscheck_ast.StdlibDir()
-    paths = crosscheck_ast.StdlibFiles(root)
-    count = 12 if kSanitized else 40
-    sample = paths[::max(1, len(paths) // count)][:count]
-    big = kBigFiles[:1] if kSanitized else kBigFiles
-    return sample + [os.path.join(root, name) for name in big]
-
-
-def Pass(source):
-    lst = ReadLogicals(textwrap.dedent(source))
+def Pass(lst):
     CChangeFinder(lst).FindChanges(lst, [])
     return lst
-
-
-def Names(source):
-    """{lineno: (fScopeName, fLocalScopeName)} after a whole-file pass."""
-    return dict((l.fLineno, (l.fScopeName, l.fLocalScopeName)) for l in Pass(source))
-
-
-def Scopes(source):
-    return dict((l.fLineno, l.fScopeName) for l in Pass(source))
 
 
 class StdlibTest(unittest.TestCase):
 
     def testSampleAgreesWithAst(self):
+        root = crosscheck_ast.StdlibDir()
+        paths = crosscheck_ast.StdlibFiles(root)
+        count = 12 if SANITIZED else 40
+        sample = paths[::max(1, len(paths) // count)][:count]
+        sample += [os.path.join(root, name) for name in kBigFiles[:1 if SANITIZED else None]]
         files = logicals = 0
         found = []
-        for path in StdlibSample():
+        for path in sample:
             checked, disagreements = crosscheck_ast.check_file(path, whitespace=True)
-            if checked:
-                files += 1
+            files += bool(checked)
             logicals += checked
             found.extend(disagreements)
         self.assertEqual([], [repr(d) for d in found[:20]])
@@ -61,298 +42,153 @@ class StdlibTest(unittest.TestCase):
         self.assertGreater(files, 10)
         self.assertGreater(logicals, 5000)
 
-    def testMainReportsCountsAndExitStatus(self):
-        path = os.path.join(crosscheck_ast.StdlibDir(), 'bisect.py')
-        saved, sys.stdout = sys.stdout, StringIO()
-        try:
-            status = crosscheck_ast.main([path])
-        finally:
-            out, sys.stdout = sys.stdout.getvalue(), saved
-        self.assertEqual(0, status)
-        self.assertIn('files checked: 1 ', out)
-        self.assertIn('disagreements: 0 ', out)
-
-    def testRefusedFileIsSkipped(self):
-        path = os.path.join(crosscheck_ast.StdlibDir(), 'lib2to3', 'tests', 'data',
-                            'py3_test_grammar.py')
-        if not os.path.exists(path):
-            self.skipTest('no Python 3 grammar sample in this library')
-        self.assertEqual((0, []), crosscheck_ast.check_file(path))
+    def testCheckerCatchesAPlantedWrongName(self):
+        source = 'class A(object):\n    @staticmethod\n    def f():\n        pass\n'
+        lst = Pass(ReadLogicals(source))
+        self.assertEqual([], crosscheck_ast.CompareWithAst(lst, ast.parse(source), whitespace=True)[1])
+        lst[1].fScopeName = 'A#0.f#0'  # a decorator belongs outside the def
+        found = crosscheck_ast.CompareWithAst(lst, ast.parse(source), whitespace=True)[1]
+        self.assertEqual([(2, 'A#0.f#0')], [(d.lineno, d.actual) for d in found])
 
 
-class CheckerCatchesFaultsTest(unittest.TestCase):
-    """The oracle must notice wrong names, or its silence proves nothing."""
-
-    kSource = textwrap.dedent('''\
-        class A(object):
-            @staticmethod
-            def f():
-                try:
+# (source, {lineno: fScopeName or (fScopeName, fLocalScopeName)}); every
+# source also agrees with the ast, comments and blank lines included.
+kSources = [
+    (D('''\
+        x = 1
+        class A:
+            y = 2
+            class B(object):
+                def m(self):
+                    def inner():
+                        return 3
+                    return inner
+            z = 4
+        w = 5
+        '''), {1: ('', None), 2: ('', 'A#0'), 3: ('A#0', None), 4: ('A#0', 'B#0'), 5: ('A#0.B#0', 'm#0'),
+               6: ('A#0.B#0.m#0', 'inner#0'), 7: ('A#0.B#0.m#0.inner#0', None), 8: ('A#0.B#0.m#0', None),
+               9: ('A#0', None), 10: ('', None)}),
+    (D('''\
+        def f(): return 1
+        def g():
+            if x: return 2
+            for i in y:
+                pass
+            else:
+                pass
+        class C: pass
+        '''), {1: '', 2: '', 3: 'g#0', 4: 'g#0', 5: 'g#0', 6: 'g#0', 7: 'g#0', 8: ''}),
+    # Clause headers stay in the statement's scope.
+    (D('''\
+        def f():
+            try:
+                def g():
                     pass
-                except ValueError:
-                    def f():
-                        pass
-                else:
-                    x = 1
+            except (IOError,
+                    OSError):
+                pass
+            finally:
+                pass
+            while 1:
+                class K:
+                    pass
+            else:
+                pass
+            with a as b:
+                pass
+        '''), {5: 'f#0', 8: 'f#0', 13: 'f#0', 15: 'f#0'}),
+    # Repeated names are numbered per containing scope.
+    (D('''\
+        def f(): pass
+        class A:
+            def f(self): pass
+            def f(self): pass
+            def g(self):
+                def f(): pass
+            def f(self): pass
+        def f(): pass
+        def f(): pass
+        '''), {1: ('', 'f#0'), 3: ('A#0', 'f#0'), 4: ('A#0', 'f#1'), 6: ('A#0.g#0', 'f#0'),
+               7: ('A#0', 'f#2'), 8: ('', 'f#1'), 9: ('', 'f#2')}),
+    ('class X: pass\ndef X(): pass\nclass X:\n    def X(self): pass\n    class X: pass\n',
+     {1: ('', 'X#0'), 2: ('', 'X#1'), 3: ('', 'X#2'), 4: ('X#2', 'X#0'), 5: ('X#2', 'X#1')}),
+    (D('''\
+        class P(object):
+            @property
+            def v(self):
+                return self._v
+            @v.setter
+            def v(self, value):
+                self._v = value
+        '''), {1: '', 2: 'P#0', 3: ('P#0', 'v#0'), 4: 'P#0.v#0', 5: 'P#0', 6: ('P#0', 'v#1'), 7: 'P#0.v#1'}),
+    (D('''\
+        class A:
+            @one
+            # between decorators
+            @two(lambda x: x,
+                 3)
+
             def f(self):
-                """Doc
-                string."""
-        ''')
-
-    def Compare(self, mutate):
-        lst = ReadLogicals(self.kSource)
-        CChangeFinder(lst).FindChanges(lst, [])
-        mutate(lst)
-        return crosscheck_ast.CompareWithAst(lst, ast.parse(self.kSource), whitespace=True)[1]
-
-    def testCorrectNamesGiveNothing(self):
-        self.assertEqual([], self.Compare(lambda lst: None))
-
-    def testEachWrongFieldIsReported(self):
-        def Corrupt(lineno, field, value):
-            def Mutate(lst):
-                logical = [l for l in lst if l.fLineno == lineno][0]
-                setattr(logical, field, value)
-            found = self.Compare(Mutate)
-            # A def's full name goes wrong with its scope name: same line.
-            self.assertEqual([lineno], sorted(set(d.lineno for d in found)), found)
-            self.assertEqual(value, found[0].actual)
-        Corrupt(2, 'fScopeName', 'A#0.f#0')       # a decorator belongs outside the def
-        Corrupt(3, 'fLocalScopeName', 'f#1')
-        Corrupt(7, 'fLocalScopeName', 'f#1')      # counted per containing scope
-        Corrupt(9, 'fScopeName', 'A#0.f#0.f#0')   # `else:` belongs to the try
-        Corrupt(12, 'fScopeName', 'A#0')          # a multi-line docstring's first line
-        Corrupt(11, 'fScopeName', '')
-
-
-class NestingTest(unittest.TestCase):
-
-    def testStatementsTakeTheInnermostClassOrDef(self):
-        names = Names('''\
+                @three
+                class B: pass
+        '''), {2: ('A#0', None), 4: ('A#0', None), 7: ('A#0', 'f#0'), 8: ('A#0.f#0', None),
+               9: ('A#0.f#0', 'B#0')}),
+    # Comments and blank lines: the next code line's scope when indented no
+    # deeper than it, otherwise decided by the first code line above.
+    ('class A:\n    def f(self):\n        x = 1\n# at the margin\n  # between margins\n        y = 2\n',
+     {4: 'A#0.f#0', 5: 'A#0.f#0'}),
+    (D('''\
+        def f():
             x = 1
-            class A:
-                y = 2
-                class B(object):
-                    def m(self):
-                        def inner():
-                            return 3
-                        return inner
-                z = 4
-            w = 5
-            ''')
-        self.assertEqual({
-            1: ('', None), 2: ('', 'A#0'), 3: ('A#0', None), 4: ('A#0', 'B#0'),
-            5: ('A#0.B#0', 'm#0'), 6: ('A#0.B#0.m#0', 'inner#0'),
-            7: ('A#0.B#0.m#0.inner#0', None), 8: ('A#0.B#0.m#0', None),
-            9: ('A#0', None), 10: ('', None)}, names)
 
-    def testSiblingScopesAndOneLineBodies(self):
-        scopes = Scopes('''\
-            def f(): return 1
-            def g():
-                if x: return 2
-                for i in y:
-                    pass
-                else:
-                    pass
-            class C: pass
-            ''')
-        self.assertEqual({1: '', 2: '', 3: 'g#0', 4: 'g#0', 5: 'g#0', 6: 'g#0',
-                          7: 'g#0', 8: ''}, scopes)
-
-    def testClauseHeadersStayInTheStatementsScope(self):
-        source = '''\
-            def f():
-                try:
-                    def g():
-                        pass
-                except (IOError,
-                        OSError):
-                    pass
-                finally:
-                    pass
-                while 1:
-                    class K:
-                        pass
-                else:
-                    pass
-                with a as b:
-                    pass
-            '''
-        scopes = Scopes(source)
-        for lineno in (5, 8, 13, 15):
-            self.assertEqual('f#0', scopes[lineno], lineno)
-        self.assertEqual([], crosscheck_ast.check_source(textwrap.dedent(source))[1])
-
-
-class RepeatedDefinitionsTest(unittest.TestCase):
-
-    def testNumberedPerContainingScope(self):
-        names = Names('''\
-            def f(): pass
-            class A:
-                def f(self): pass
-                def f(self): pass
-                def g(self):
-                    def f(): pass
-                def f(self): pass
-            def f(): pass
-            def f(): pass
-            ''')
-        locals_ = dict((n, v[1]) for n, v in names.items())
-        self.assertEqual(['f#0', 'f#0', 'f#1', 'f#0', 'f#2', 'f#1', 'f#2'],
-                         [locals_[n] for n in (1, 3, 4, 6, 7, 8, 9)])
-        self.assertEqual('A#0.g#0', names[6][0])
-
-    def testClassAndDefOfOneNameShareACounter(self):
-        names = Names('''\
-            class X: pass
-            def X(): pass
-            class X:
-                def X(self): pass
-                class X: pass
-            ''')
-        self.assertEqual(['X#0', 'X#1', 'X#2', 'X#0', 'X#1'],
-                         [names[n][1] for n in range(1, 6)])
-        self.assertEqual('X#2', names[4][0])
-
-    def testBodiesOfRepeatedDefinitionsAreKeptApart(self):
-        scopes = Scopes('''\
-            class P(object):
-                @property
-                def v(self):
-                    return self._v
-                @v.setter
-                def v(self, value):
-                    self._v = value
-            ''')
-        self.assertEqual({1: '', 2: 'P#0', 3: 'P#0', 4: 'P#0.v#0', 5: 'P#0', 6: 'P#0',
-                          7: 'P#0.v#1'}, scopes)
-
-
-class DecoratorTest(unittest.TestCase):
-
-    def testDecoratorLinesBelongToTheEnclosingScope(self):
-        source = '''\
-            class A:
-                @one
-                # between decorators
-                @two(lambda x: x,
-                     3)
-
-                def f(self):
-                    @three
-                    class B: pass
-            '''
-        names = Names(source)
-        self.assertEqual(('A#0', None), names[2])
-        self.assertEqual(('A#0', None), names[4])
-        self.assertEqual(('A#0', 'f#0'), names[7])
-        self.assertEqual(('A#0.f#0', None), names[8])
-        self.assertEqual(('A#0.f#0', 'B#0'), names[9])
-        self.assertEqual([], crosscheck_ast.check_source(textwrap.dedent(source),
-                                                         whitespace=True)[1])
-
-
-class WhitespacePlacementTest(unittest.TestCase):
-    """Comments and blank lines: the next code line's scope when indented no
-    deeper than it, otherwise decided by the first code line above."""
-
-    def Check(self, source, expected):
-        scopes = Scopes(source)
-        self.assertEqual(expected, dict((n, scopes[n]) for n in expected))
-        self.assertEqual([], crosscheck_ast.check_source(textwrap.dedent(source),
-                                                         whitespace=True)[1])
-
-    def testDedentedCommentInsideABodyTakesTheNextLinesScope(self):
-        self.Check('''\
-            class A:
-                def f(self):
-                    x = 1
-            # at the margin
-              # between margins
-                    y = 2
-            ''', {4: 'A#0.f#0', 5: 'A#0.f#0'})
-
-    def testCommentsBeforeADedent(self):
-        self.Check('''\
-            def f():
-                x = 1
-
-                # deeper than the next code line: stays with x
-            # about g
-            def g():
-                pass
-            ''', {3: '', 4: 'f#0', 5: ''})
-
-    def testCommentDeeperThanTheInnermostScope(self):
-        self.Check('''\
-            def f():
-                x = 1
-                        # deeper than any code
-                y = 2
-            def g():
-                        # deeper, right after the header
-                pass
-            ''', {3: 'f#0', 6: 'g#0'})
-
-    def testCommentAfterAHeaderAtTheHeadersIndent(self):
-        # Not deeper than the header: the header's own scope, not the one it opens.
-        self.Check('''\
-            class A:
-                def f(self):
-                # level with the def
-                    pass
-            ''', {3: 'A#0.f#0'})
-        self.Check('''\
-            class A:
-                def f(self): pass
-                # level with the def, before a dedent
+            # deeper than the next code line: stays with x
+        # about g
+        def g():
+            pass
+        '''), {3: '', 4: 'f#0', 5: ''}),
+    (D('''\
+        def f():
             x = 1
-            ''', {3: 'A#0'})
+                    # deeper than any code
+            y = 2
+        def g():
+                    # deeper, right after the header
+            pass
+        '''), {3: 'f#0', 6: 'g#0'}),
+    # Level with a header: the header's own scope, not the one it opens.
+    ('class A:\n    def f(self):\n    # level with the def\n        pass\n', {3: 'A#0.f#0'}),
+    ('class A:\n    def f(self): pass\n    # level with the def, before a dedent\nx = 1\n', {3: 'A#0'}),
+    # Trailing comments act as if a module-level line followed.
+    (D('''\
+        class A:
+            def f(self):
+                pass
+            # in A, as the last code sees it
+        # module level
+                # deeper again
 
-    def testTrailingCommentsActAsIfAModuleLineFollowed(self):
-        self.Check('''\
-            class A:
-                def f(self):
-                    pass
-                # in A, as the last code sees it
-            # module level
-                    # deeper again
-
-            ''', {4: 'A#0.f#0', 5: '', 6: 'A#0.f#0', 7: ''})
-
-    def testBlankLinesWithTrailingSpaces(self):
-        source = 'def f():\n    x = 1\n        \n    y = 2\n    \nz = 3\n'
-        lst = ReadLogicals(source)  # not Pass: dedent would empty the blank lines
-        CChangeFinder(lst).FindChanges(lst, [])
-        self.assertEqual([8, 4], [l.fIndent for l in lst if l.fKind == 22])
-        # Both deeper than the next code line: the code above decides.
-        self.assertEqual(['f#0', 'f#0'], [l.fScopeName for l in lst if l.fKind == 22])
-        self.assertEqual([], crosscheck_ast.check_source(source, whitespace=True)[1])
+        '''), {4: 'A#0.f#0', 5: '', 6: 'A#0.f#0', 7: ''}),
+    # Blank lines with trailing spaces, deeper than the next code line.
+    ('def f():\n    x = 1\n        \n    y = 2\n    \nz = 3\n', {3: 'f#0', 5: 'f#0'}),
+]
 
 
-class NamelessDefTest(unittest.TestCase):
-    """A def line whose name cannot be read opens no scope of its own."""
+class HandWrittenSourcesTest(unittest.TestCase):
 
-    def Run(self, specs):
-        lst = [LogicalLineType(tokens, n, indent, kind)
-               for n, (tokens, indent, kind) in enumerate(specs, 1)]
-        CChangeFinder(lst).FindChanges(lst, [])
-        return lst
+    def testNames(self):
+        for i, (source, expected) in enumerate(kSources):
+            lst = Pass(ReadLogicals(source))
+            got = dict((l.fLineno, (l.fScopeName, l.fLocalScopeName)) for l in lst)
+            for lineno, want in expected.items():
+                self.assertEqual(got[lineno] if isinstance(want, tuple) else got[lineno][0], want,
+                                 'source %d, line %d' % (i, lineno))
+            self.assertEqual([], crosscheck_ast.check_source(source, whitespace=True)[1], i)
 
-    def testBodyStaysInTheEnclosingScope(self):
-        lst = self.Run([
-            (['class', 'A', ':'], 0, 1),
-            (['def'], 4, 2),
-            (['x', '=', '1'], 8, 0),
-            (['def', 'g', '(', ')', ':'], 4, 2),
-            (['y'], 8, 0),
-            (['def'], 0, 2),
-            (['z'], 4, 0),
-        ])
-        self.assertEqual(['', 'A#0', 'A#0', 'A#0', 'A#0.g#0', '', ''],
-                         [l.fScopeName for l in lst])
+    def testNamelessDefOpensNoScope(self):
+        lst = Pass([LogicalLineType(tokens, n, indent, kind) for n, (tokens, indent, kind) in enumerate([
+            (['class', 'A', ':'], 0, 1), (['def'], 4, 2), (['x', '=', '1'], 8, 0),
+            (['def', 'g', '(', ')', ':'], 4, 2), (['y'], 8, 0), (['def'], 0, 2), (['z'], 4, 0)], 1)])
+        self.assertEqual(['', 'A#0', 'A#0', 'A#0', 'A#0.g#0', '', ''], [l.fScopeName for l in lst])
         self.assertEqual('g#0', lst[3].fLocalScopeName)
 
 

@@ -26,21 +26,9 @@ import os
 import random
 import sys
 
-_kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
+import toolpath
 
-
-def _ImportPackages():
-    try:
-        import pysource.scopebodycache  # noqa: F401
-    except ImportError:
-        for name in list(sys.modules):
-            if name.split('.')[0] in ('pysource', 'tallowkit'):
-                del sys.modules[name]
-        sys.path.insert(0, os.path.join(_kRepoDir, 'build', 'python'))
-        import pysource.scopebodycache  # noqa: F401
-
-
-_ImportPackages()
+toolpath.setup()
 
 from pysource.logicals import ReadLogicals  # noqa: E402
 from pysource.scopebodycache import CChangeFinder, GetFullNameForScopeDef  # noqa: E402

@@ -23,23 +23,9 @@ import bisect
 import os
 import sys
 
-_kToolsDir = os.path.dirname(os.path.abspath(__file__))
-_kRepoDir = os.path.dirname(_kToolsDir)
+import toolpath
 
-
-def _ImportPackages():
-    """Imports the built packages, falling back to <repo>/build/python."""
-    try:
-        import pysource.scopebodycache  # noqa: F401
-    except ImportError:
-        for name in list(sys.modules):
-            if name.split('.')[0] in ('pysource', 'tallowkit'):
-                del sys.modules[name]
-        sys.path.insert(0, os.path.join(_kRepoDir, 'build', 'python'))
-        import pysource.scopebodycache  # noqa: F401
-
-
-_ImportPackages()
+toolpath.setup()
 
 from pysource.logicals import ReadLogicals  # noqa: E402
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache, GetFullNameForScopeDef  # noqa: E402

@@ -16,26 +16,11 @@ import keyword
 import os
 import sys
 
-_kToolsDir = os.path.dirname(os.path.abspath(__file__))
-_kRepoDir = os.path.dirname(_kToolsDir)
+import toolpath
+
+_kRepoDir = toolpath.setup()
+_kToolsDir = toolpath.kToolsDir
 kSamplePath = os.path.join(_kRepoDir, 'samples', 'outline_sample.py')
-
-
-def _ImportPackages():
-    """Imports the built packages, falling back to <repo>/build/python."""
-    try:
-        import pysource.scopebodycache  # noqa: F401
-    except ImportError:
-        # A stale half-import (e.g. the source tree's pysource without the
-        # built extensions) would shadow the build directory.
-        for name in list(sys.modules):
-            if name.split('.')[0] in ('pysource', 'tallowkit'):
-                del sys.modules[name]
-        sys.path.insert(0, os.path.join(_kRepoDir, 'build', 'python'))
-        import pysource.scopebodycache  # noqa: F401
-
-
-_ImportPackages()
 
 from pysource import symbolinfo  # noqa: E402
 from pysource.logicals import ReadLogicals  # noqa: E402

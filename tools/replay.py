@@ -37,26 +37,12 @@ import sys
 import time
 import traceback
 
-_kToolsDir = os.path.dirname(os.path.abspath(__file__))
-_kRepoDir = os.path.dirname(_kToolsDir)
+import toolpath
+
+_kRepoDir = toolpath.setup()
 kSamplePath = os.path.join(_kRepoDir, 'samples', 'outline_sample.py')
 kStdlibDir = os.path.expanduser('~/.pyenv/versions/2.7.18/lib/python2.7')
 kDefaultReproDir = '/tmp/replay-repros'
-
-
-def _ImportPackages():
-    """Imports the built packages, falling back to <repo>/build/python."""
-    try:
-        import pysource.scopebodycache  # noqa: F401
-    except ImportError:
-        for name in list(sys.modules):
-            if name.split('.')[0] in ('pysource', 'tallowkit'):
-                del sys.modules[name]
-        sys.path.insert(0, os.path.join(_kRepoDir, 'build', 'python'))
-        import pysource.scopebodycache  # noqa: F401
-
-
-_ImportPackages()
 
 from pysource._fastaccess import LogicalLineType  # noqa: E402
 from pysource.logicals import ReadLogicals  # noqa: E402
