@@ -191,46 +191,6 @@ class IndexRepair(unittest.TestCase):
         self.assertEqual(names(lst), fresh_names(new))
 
 
-class CommentAndBlankRuns(unittest.TestCase):
-    """Each case broke an editor's view of the file before it was mended."""
-
-    def check(self, old, new):
-        lst, finder, result = edited(old, new)
-        self.assertEqual(names(lst), fresh_names(new))
-        return lst, result
-
-    def test_typing_before_a_blank_and_a_dedented_line(self):
-        self.check("class A:\n    def f(self):\n        x = 1\n\ny = 2\n",
-                   "class A:\n    def f(self):\n        x = 12\n\ny = 2\n")
-
-    def test_run_placed_by_a_line_that_changed(self):
-        lst, result = self.check("def f():\n    x = 1\n\ny = 2\n",
-                                 "def f():\n    x = 1\n\n    z = 3\ny = 2\n")
-        self.assertEqual(scope_names(lst), ['', 'f#0', 'f#0', 'f#0', ''])
-
-    def test_blank_after_a_class_header(self):
-        lst, result = self.check("class A:\n\n    x = 1\n", "class A:\n\n    x = 2\n")
-        self.assertEqual(scope_names(lst), ['', 'A#0', 'A#0'])
-
-    def test_scan_does_not_stop_at_an_unchanged_blank(self):
-        lst, result = self.check("if True:\n\n    y = 2\n", "def g():\n\n    y = 2\n")
-        self.assertEqual(scope_names(lst), ['', 'g#0', 'g#0'])
-
-    def test_dedented_run_at_the_end_of_the_list(self):
-        self.check("def f():\n    x = 1\n", "def f():\n    x = 1\n# end\n")
-        self.check("def f():\n    x = 1\n# a\n", "def f():\n    x = 1\n# a\n    # b\n\n")
-
-    def test_removing_the_last_line_moves_the_run_before_it(self):
-        self.check("def f():\n    x = 1\n\n        y = 2\n", "def f():\n    x = 1\n\n")
-
-    def test_comment_inserted_between_a_header_and_its_body(self):
-        self.check("class A:\n    x = 1\n", "class A:\n# note\n    x = 1\n")
-
-    def test_removing_the_line_a_comment_run_belonged_to(self):
-        self.check("def f():\n    x = 1\n# c\n    y = 2\nz = 3\n",
-                   "def f():\n    x = 1\n# c\nz = 3\n")
-
-
 class OverridingSubclasses(unittest.TestCase):
 
     def edit_with(self, finder_class):

@@ -131,6 +131,10 @@ kScenarios = [
      '    def s(obj):\n        a = 1\n        b = 2\n    c = 3\n'),
     ('def f():\n    x = 1\ny = 2\n',
      'def f():\n    x = 1\n    \ny = 2\n'),
+    ('def f():\n    x = 1\n\n        y = 2\n', 'def f():\n    x = 1\n\n'),
+    ('class A:\n    x = 1\n', 'class A:\n# note\n    x = 1\n'),
+    ('def f():\n    x = 1\n# c\n    y = 2\nz = 3\n', 'def f():\n    x = 1\n# c\nz = 3\n'),
+    ('def f():\n    x = 1\n', 'def f():\n    x = 1\n# end\n'),
 ]
 # Several changes in one call.
 kBatchScenarios = [
