@@ -110,39 +110,44 @@ py::Ref UpdateLogicalScopeName(PyObject* self, PyObject* logicalObj, Py_ssize_t 
     return py::Ref::own(scopeName);
 }
 
+namespace {
+
+[[noreturn]] void raiseUnpackCount(Py_ssize_t found) {
+    if (found < 2) {
+        PyErr_Format(PyExc_ValueError, msg::kNeedMoreValues, found, found == 1 ? "" : "s");
+    } else {
+        PyErr_Format(PyExc_ValueError, msg::kTooManyValues, Py_ssize_t(2));
+    }
+    py::fail();
+}
+
+// `a, b = pair`: tuples and lists directly, anything else by iteration.
+void unpackPair(PyObject* pair, py::Ref* first, py::Ref* second) {
+    if (PyTuple_CheckExact(pair) || PyList_CheckExact(pair)) {
+        const Py_ssize_t n = PySequence_Fast_GET_SIZE(pair);
+        if (n != 2) raiseUnpackCount(n);
+        *first = py::Ref::own(PySequence_Fast_GET_ITEM(pair, 0));
+        *second = py::Ref::own(PySequence_Fast_GET_ITEM(pair, 1));
+        return;
+    }
+    py::Ref iter = py::check(PyObject_GetIter(pair));
+    py::Ref items[3];
+    Py_ssize_t n = 0;
+    for (; n < 3; ++n) {
+        items[n] = py::Ref::steal(PyIter_Next(iter.get()));
+        if (!items[n]) break;
+    }
+    if (PyErr_Occurred()) py::fail();
+    if (n != 2) raiseUnpackCount(n);
+    *first = std::move(items[0]);
+    *second = std::move(items[1]);
+}
+
+}  // namespace
+
 bool SetLogicalScopeNames(PyObject* self, PyObject* logicalObj, Py_ssize_t i, PyObject* pair) {
     py::Ref scope, local;
-    if ((PyTuple_CheckExact(pair) || PyList_CheckExact(pair)) && PySequence_Fast_GET_SIZE(pair) != 2) {
-        const Py_ssize_t n = PySequence_Fast_GET_SIZE(pair);
-        if (n < 2) {
-            PyErr_Format(PyExc_ValueError, msg::kNeedMoreValues, n, n == 1 ? "" : "s");
-        } else {
-            PyErr_Format(PyExc_ValueError, msg::kTooManyValues, Py_ssize_t(2));
-        }
-        py::fail();
-    }
-    {
-        py::Ref iter = py::check(PyObject_GetIter(pair));
-        py::Ref items[3];
-        Py_ssize_t n = 0;
-        for (; n < 3; ++n) {
-            items[n] = py::Ref::steal(PyIter_Next(iter.get()));
-            if (!items[n]) {
-                if (PyErr_Occurred()) py::fail();
-                break;
-            }
-        }
-        if (n < 2) {
-            PyErr_Format(PyExc_ValueError, msg::kNeedMoreValues, n, n == 1 ? "" : "s");
-            py::fail();
-        }
-        if (n > 2) {
-            PyErr_Format(PyExc_ValueError, msg::kTooManyValues, Py_ssize_t(2));
-            py::fail();
-        }
-        scope = std::move(items[0]);
-        local = std::move(items[1]);
-    }
+    unpackPair(pair, &scope, &local);
     assertThat(!scope.isNone());
     assertAt(self, i, logicalObj);
     Logical* logical = requireLogical(logicalObj);
