@@ -72,7 +72,7 @@ class ReplayToolTest(unittest.TestCase):
 class StdlibReplayTest(unittest.TestCase):
 
     def testSeededEditsOnAFixedSampleAgree(self):
-        files, edits = (3, 30) if SANITIZED else (12, 150)
+        files, edits = (8, 80) if SANITIZED else (16, 150)
         paths = replay.SampleFiles(replay.StdlibFiles(), files, 'test_replay', max_lines=1500)
         self.assertEqual(len(paths), files)
         log = tempfile.TemporaryFile()
