@@ -16,26 +16,15 @@ import resource
 import sys
 import time
 
-_kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
+import toolpath  # noqa: E402
 
-try:
-    import pysource.scopebodycache  # noqa: F401
-except ImportError:
-    for _name in list(sys.modules):
-        if _name.split('.')[0] in ('pysource', 'tallowkit'):
-            del sys.modules[_name]
-    sys.path.insert(0, os.path.join(_kRepoDir, 'build', 'python'))
+toolpath.setup()
 
 from pysource.logicals import ReadLogicals  # noqa: E402
 from pysource.scopebodycache import CChangeFinder  # noqa: E402
 
-
-def StdlibFiles(root):
-    paths = []
-    for dirpath, dirnames, filenames in os.walk(root):
-        dirnames[:] = sorted(d for d in dirnames if d != 'site-packages')
-        paths.extend(os.path.join(dirpath, f) for f in filenames if f.endswith('.py'))
-    return sorted(paths)
+StdlibFiles = toolpath.StdlibFiles
 
 
 def ReadAll(paths):
@@ -68,7 +57,7 @@ def TimeTouch(lists):
 
 def main(argv=None):
     parser = argparse.ArgumentParser(prog='bench_whole_pass.py')
-    parser.add_argument('root', nargs='?', default=os.path.dirname(os.path.abspath(os.__file__)),
+    parser.add_argument('root', nargs='?', default=toolpath.StdlibDir(),
                         help='directory of .py files (default: the standard library)')
     parser.add_argument('--repeat', type=int, default=3, metavar='N')
     args = parser.parse_args(argv)

@@ -253,18 +253,8 @@ def check_source(source, path='<string>', whitespace=False):
     return CheckLogicals(lst, tree, path, whitespace)
 
 
-def StdlibDir():
-    return os.path.dirname(os.path.abspath(os.__file__))
-
-
-def StdlibFiles(root=None):
-    """Sorted paths of the standard library's .py files, site-packages excluded."""
-    root = root or StdlibDir()
-    paths = []
-    for dirpath, dirnames, filenames in os.walk(root):
-        dirnames[:] = sorted(d for d in dirnames if d != 'site-packages')
-        paths.extend(os.path.join(dirpath, f) for f in filenames if f.endswith('.py'))
-    return sorted(paths)
+StdlibDir = toolpath.StdlibDir
+StdlibFiles = toolpath.StdlibFiles
 
 
 def main(argv=None):

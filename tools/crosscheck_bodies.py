@@ -156,16 +156,8 @@ def CheckFiles(paths):
     return totals
 
 
-def PythonFiles(root):
-    found = []
-    for dirpath, dirnames, filenames in os.walk(root):
-        dirnames[:] = sorted(d for d in dirnames if d != 'site-packages')
-        found.extend(os.path.join(dirpath, f) for f in filenames if f.endswith('.py'))
-    return sorted(found)
-
-
-def StdlibDir():
-    return os.path.dirname(os.__file__)
+PythonFiles = toolpath.StdlibFiles
+StdlibDir = toolpath.StdlibDir
 
 
 def main(argv=None):

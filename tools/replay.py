@@ -41,7 +41,7 @@ import toolpath
 
 _kRepoDir = toolpath.setup()
 kSamplePath = os.path.join(_kRepoDir, 'samples', 'outline_sample.py')
-kStdlibDir = os.path.expanduser('~/.pyenv/versions/2.7.18/lib/python2.7')
+kStdlibDir = toolpath.StdlibDir()
 kDefaultReproDir = '/tmp/replay-repros'
 
 from pysource._fastaccess import LogicalLineType  # noqa: E402
@@ -1180,13 +1180,7 @@ def _Percentile(sorted_values, fraction):
     return sorted_values[k]
 
 
-def StdlibFiles(root=kStdlibDir):
-    """Every .py file of the standard library, test/ included, site-packages not."""
-    out = []
-    for dirpath, dirnames, filenames in os.walk(root):
-        dirnames[:] = sorted(d for d in dirnames if d != 'site-packages')
-        out.extend(os.path.join(dirpath, f) for f in sorted(filenames) if f.endswith('.py'))
-    return out
+StdlibFiles = toolpath.StdlibFiles
 
 
 def SeededRandom(*parts):

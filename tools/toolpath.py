@@ -23,3 +23,18 @@ def setup():
         sys.path.insert(0, os.path.join(kRepoDir, 'build', 'python'))
         import pysource.scopebodycache  # noqa: F401
     return kRepoDir
+
+
+def StdlibDir():
+    """The standard library of the running interpreter."""
+    return os.path.dirname(os.path.abspath(os.__file__))
+
+
+def StdlibFiles(root=None):
+    """Sorted paths of the .py files under root (default: the standard
+    library), test/ included, site-packages not."""
+    paths = []
+    for dirpath, dirnames, filenames in os.walk(root or StdlibDir()):
+        dirnames[:] = sorted(d for d in dirnames if d != 'site-packages')
+        paths.extend(os.path.join(dirpath, f) for f in filenames if f.endswith('.py'))
+    return sorted(paths)
