@@ -86,7 +86,10 @@ Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first) noexcept;
 Py_ssize_t ProcessDedentedCommentsBody(PyObject* self, Py_ssize_t first);
 void LogicalInScopeChanged(PyObject* self, PyObject* logical, PyObject* scopeName,
                            PyObject* oldContainingScope, PyObject* oldLeafScope);
-bool SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* pair);
+bool SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName,
+                          PyObject* localName);
+// `a, b = pair` as the interpreter does it.
+void unpackPair(PyObject* pair, py::Ref* first, py::Ref* second);
 py::Ref UpdateLogicalScopeName(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
 void UpdateContainingScope(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
 void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName,
@@ -113,7 +116,9 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
 Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first) noexcept;
 void LogicalInScopeChanged(PyObject* self, PyObject* logical, PyObject* scopeName,
                            PyObject* oldContainingScope = Py_None, PyObject* oldLeafScope = Py_None);
-void SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* pair);
+// An override gets the names as one pair.
+void SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName,
+                          PyObject* localName);
 void UpdateLogicalScopeName(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
 void UpdateContainingScope(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
 void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName,

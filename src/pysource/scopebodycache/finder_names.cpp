@@ -121,7 +121,9 @@ namespace {
     py::fail();
 }
 
-// `a, b = pair`: tuples and lists directly, anything else by iteration.
+}  // namespace
+
+// Tuples and lists directly, anything else by iteration.
 void unpackPair(PyObject* pair, py::Ref* first, py::Ref* second) {
     if (PyTuple_CheckExact(pair) || PyList_CheckExact(pair)) {
         const Py_ssize_t n = PySequence_Fast_GET_SIZE(pair);
@@ -143,18 +145,17 @@ void unpackPair(PyObject* pair, py::Ref* first, py::Ref* second) {
     *second = std::move(items[1]);
 }
 
-}  // namespace
-
-bool SetLogicalScopeNames(PyObject* self, PyObject* logicalObj, Py_ssize_t i, PyObject* pair) {
-    py::Ref scope, local;
-    unpackPair(pair, &scope, &local);
+bool SetLogicalScopeNames(PyObject* self, PyObject* logicalObj, Py_ssize_t i, PyObject* scopeName,
+                          PyObject* localName) {
+    py::Ref scope = py::Ref::own(scopeName);
+    py::Ref local = py::Ref::own(localName);
     assertThat(!scope.isNone());
     assertAt(self, i, logicalObj);
     Logical* logical = requireLogical(logicalObj);
     py::Ref keep = py::Ref::own(logicalObj);
 
     bool changed = false;
-    PyObject* old = scopeName(logical);
+    PyObject* old = contracts::scopeName(logical);
     requireStrOrNone(old);
     if (old == Py_None || !strEquals(old, scope.get())) {
         requireStrOrNone(scope.get());

@@ -120,8 +120,7 @@ void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
         if (py::checkStatus(PyObject_RichCompareBool(newIndex.get(), oldIndex.get(), Py_EQ))) continue;
 
         py::Ref newLocal = appendScopeSuffixes(bare.get(), newIndex.get());
-        py::Ref pair = py::check(PyTuple_Pack(2, scope.get(), newLocal.get()));
-        route::SetLogicalScopeNames(self, item.get(), j, pair.get());
+        route::SetLogicalScopeNames(self, item.get(), j, scope.get(), newLocal.get());
         route::LogicalInScopeChanged(self, item.get(), scope.get());
         const bool hadIndex = PyInt_AsLong(oldIndex.get()) != -1 || PyErr_Occurred();
         if (PyErr_Occurred()) py::fail();

@@ -116,7 +116,10 @@ PyObject* m_LogicalInScopeChanged(PyObject* self, PyObject* const* a) {
     return none();
 }
 PyObject* m_SetLogicalScopeNames(PyObject* self, PyObject* const* a) {
-    const bool changed = finder::SetLogicalScopeNames(self, a[0], py::asIndex(a[1]), a[2]);
+    py::Ref scope, local;
+    finder::unpackPair(a[2], &scope, &local);
+    const bool changed =
+        finder::SetLogicalScopeNames(self, a[0], py::asIndex(a[1]), scope.get(), local.get());
     return py::Ref::own(changed ? Py_True : Py_False).release();
 }
 PyObject* m_UpdateLogicalScopeName(PyObject* self, PyObject* const* a) {
@@ -323,14 +326,14 @@ void LogicalInScopeChanged(PyObject* self, PyObject* logical, PyObject* scopeNam
         logical, scopeName, oldContainingScope, oldLeafScope);
 }
 
-void SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* pair) {
-    dispatch(
-        self, Step::SetLogicalScopeNames,
-        [&] {
-            finder::SetLogicalScopeNames(self, logical, i, pair);
-            return py::Ref();
-        },
-        logical, i, pair);
+void SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName,
+                          PyObject* localName) {
+    if (py::Ref override = findOverride(self, Step::SetLogicalScopeNames)) {
+        py::Ref pair = py::check(PyTuple_Pack(2, scopeName, localName));
+        callOverride(override, logical, i, pair.get());
+        return;
+    }
+    finder::SetLogicalScopeNames(self, logical, i, scopeName, localName);
 }
 
 void UpdateLogicalScopeName(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName) {

@@ -50,8 +50,7 @@ void FindChangesEntireListAdded(PyObject* self) {
             local = route::GetLeafScopeWithIndex(self, item.get(), index);
         }
         py::Ref top = stack.back().name.copy();
-        py::Ref pair = py::check(PyTuple_Pack(2, top.get(), local.get()));
-        route::SetLogicalScopeNames(self, item.get(), i, pair.get());
+        route::SetLogicalScopeNames(self, item.get(), i, top.get(), local.get());
         if (scopeStart && !local.isNone()) {
             py::Ref full = joinTwoScopeNames(top.get(), local.get());
             addChange(logical->fKind == kClassLogical ? s.classChanges : s.functionChanges, full.get());
