@@ -10,6 +10,7 @@ from cStringIO import StringIO
 
 from pysource._fastaccess import LogicalLineType
 from pysource.logicals import ReadLogicals
+from pysource.scopebodycache import CChangeFinder
 
 kClassKind, kDefKind, kCommentKind, kBlankKind = 1, 2, 21, 22
 SANITIZED = bool(os.environ.get('SBC_SANITIZED'))
@@ -24,23 +25,33 @@ def Read(source):
     return ReadLogicals(textwrap.dedent(source))
 
 
+def Named(source):
+    """The logicals of `source`, named by a fresh whole-list pass."""
+    lst = Read(source)
+    CChangeFinder(lst).FindChanges(lst, [])
+    return lst
+
+
 def Names(logicals):
     return [(l.fScopeName, l.fLocalScopeName) for l in logicals]
 
 
 def WholeListNames(source):
-    """The names a fresh finder gives the logicals of `source`."""
-    from pysource.scopebodycache import CChangeFinder
-    lst = Read(source)
-    CChangeFinder(lst).FindChanges(lst, [])
-    return Names(lst)
+    return Names(Named(source))
+
+
+def Outcome(func, *args, **kwargs):
+    """The result, or (exception type, message) of what func raises."""
+    try:
+        return func(*args, **kwargs)
+    except Exception as e:
+        return type(e), e.args[0] if isinstance(e, KeyError) else str(e)
 
 
 def Edit(lst, new_source):
-    """Turns `lst` in place into the logicals of `new_source` as an editor would:
-    keeps the unchanged head and tail, replaces the middle. Returns (added, removed)."""
+    """Turns `lst` into the logicals of `new_source` as an editor would; returns (added, removed)."""
     new = Read(new_source)
-    key = lambda l: (l.fTokens, l.fIndent, l.fKind)
+    key = lambda l: (l.fTokens, l.fIndent, l.fKind)  # noqa: E731
     limit = min(len(lst), len(new))
     head = tail = 0
     while head < limit and key(lst[head]) == key(new[head]):
@@ -96,7 +107,6 @@ def Substitute(real, drop_capi=(), capi={}, drop=(), **attrs):
     sys.modules[real.__name__] = sub
 
 def Slotted(base_size, name='CDestroyable', **extra):
-    """A Python class whose instances are exactly base_size bytes."""
     count, rest = divmod(base_size - object.__basicsize__, ctypes.sizeof(ctypes.c_void_p))
     assert rest == 0 and count >= 0, base_size
     extra['__slots__'] = tuple('s%d' % k for k in range(count))
@@ -122,8 +132,7 @@ sys.stdout.write('RESULT %r\n' % (result,))
 
 
 def ImportWith(setup, after=''):
-    """Imports the module after `setup`, runs `after`; returns the child's `result` dict.
-    Values that `setup` stores in `v` come back as result['v']."""
+    """Imports the module after `setup`, runs `after`; returns the child's `result` dict."""
     status, out, err = RunPython(kImportPrelude.replace('#SETUP', textwrap.dedent(setup))
                                  .replace('#AFTER', textwrap.dedent(after)))
     lines = [l for l in out.splitlines() if l.startswith('RESULT ')]
