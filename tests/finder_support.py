@@ -30,10 +30,6 @@ def deff(lineno, indent, name):
     return logical(['def', name, '(', ')', ':'], lineno, indent, 2)
 
 
-def klass(lineno, indent, name):
-    return logical(['class', name, ':'], lineno, indent, 1)
-
-
 def whole_pass(lst, finder_class=CChangeFinder):
     finder = finder_class(lst)
     return finder, finder.FindChanges(lst, [])

@@ -6,43 +6,17 @@ from finder_support import (CChangeFinder, blank, code, comment, deff, finder_fi
 from pysource.logicals import ReadLogicals
 
 
-class NestingAndSiblings(unittest.TestCase):
-
-    def test_class_with_methods_and_nested_function(self):
-        lst = read_named(
-            "class A:\n"
-            "    def f(self):\n"
-            "        def inner():\n"
-            "            return 1\n"
-            "        return inner\n"
-            "    def g(self):\n"
-            "        pass\n"
-            "x = A()\n")
-        self.assertEqual(names(lst), [
-            ('', 'A#0'), ('A#0', 'f#0'), ('A#0.f#0', 'inner#0'), ('A#0.f#0.inner#0', None),
-            ('A#0.f#0', None), ('A#0', 'g#0'), ('A#0.g#0', None), ('', None)])
+class HandBuiltLists(unittest.TestCase):
 
     def test_def_at_same_indent_closes_the_previous_one(self):
         lst = [deff(1, 0, 'f'), deff(2, 0, 'g'), code(3, 4)]
         whole_pass(lst)
         self.assertEqual(scope_names(lst), ['', '', 'g#0'])
 
-    def test_module_level_only(self):
-        lst = read_named("x = 1\ny = 2\n")
-        self.assertEqual(scope_names(lst), ['', ''])
-
-    def test_decorators_stay_in_the_enclosing_scope(self):
-        lst = read_named(
-            "class A:\n"
-            "    @property\n"
-            "    def p(self):\n"
-            "        return 1\n"
-            "    @p.setter\n"
-            "    def p(self, v):\n"
-            "        pass\n")
-        self.assertEqual(names(lst), [
-            ('', 'A#0'), ('A#0', None), ('A#0', 'p#0'), ('A#0.p#0', None),
-            ('A#0', None), ('A#0', 'p#1'), ('A#0.p#1', None)])
+    def test_comment_at_left_margin_does_not_close_the_function(self):
+        lst = [deff(1, 0, 'f'), code(2, 4), comment(3, 0), blank(4), code(5, 4), comment(6, 0)]
+        whole_pass(lst)
+        self.assertEqual(scope_names(lst), ['', 'f#0', 'f#0', 'f#0', 'f#0', ''])
 
     def test_async_def(self):
         lst = read_named("async def f():\n    pass\n")
@@ -50,16 +24,6 @@ class NestingAndSiblings(unittest.TestCase):
 
 
 class RepeatedDefinitions(unittest.TestCase):
-
-    def test_numbered_per_containing_scope(self):
-        lst = read_named(
-            "def f(): pass\n"
-            "class f:\n"
-            "    def f(self): pass\n"
-            "    def f(self): pass\n"
-            "def f(): pass\n")
-        self.assertEqual([l.fLocalScopeName for l in lst], ['f#0', 'f#1', 'f#0', 'f#1', 'f#2'])
-        self.assertEqual(scope_names(lst), ['', '', 'f#1', 'f#1', ''])
 
     def test_change_sets(self):
         lst = ReadLogicals("class A:\n    def f(self): pass\ndef g(): pass\ndef g(): pass\n")
@@ -105,54 +69,7 @@ class RepeatedDefinitions(unittest.TestCase):
         self.assertEqual([l.fLocalScopeName for l in lst], ['f#0', 'f#1'])
 
 
-class CommentPlacement(unittest.TestCase):
-
-    def test_dedented_comment_inside_a_body_takes_the_next_line_scope(self):
-        lst = read_named("def f():\n    x = 1\n# c\n    y = 2\nz = 3\n")
-        self.assertEqual(scope_names(lst), ['', 'f#0', 'f#0', 'f#0', ''])
-
-    def test_dedented_comment_before_module_code(self):
-        lst = read_named("def f():\n    x = 1\n# c\n\nz = 3\n")
-        self.assertEqual(scope_names(lst), ['', 'f#0', '', '', ''])
-
-    def test_deeper_member_of_a_run_looks_back(self):
-        lst = read_named("def f():\n    x = 1\n# c\n    # d\nz = 3\n")
-        self.assertEqual(scope_names(lst), ['', 'f#0', '', 'f#0', ''])
-
-    def test_member_as_deep_as_the_next_line_takes_its_scope(self):
-        lst = read_named("class A:\n    def f(self):\n        x = 1\n    # c\n    y = 2\n")
-        self.assertEqual(scope_names(lst), ['', 'A#0', 'A#0.f#0', 'A#0', 'A#0'])
-
-    def test_comment_deeper_than_innermost_scope_gets_it(self):
-        lst = read_named("def f():\n    x = 1\n        # deep\ny = 2\n")
-        self.assertEqual(scope_names(lst), ['', 'f#0', 'f#0', ''])
-
-    def test_blank_right_after_a_header_belongs_to_its_body(self):
-        lst = read_named("class A:\n\n    x = 1\n")
-        self.assertEqual(scope_names(lst), ['', 'A#0', 'A#0'])
-
-    def test_trailing_run_is_placed_as_before_module_code(self):
-        lst = read_named("def f():\n    x = 1\n# end\n    # deeper\n\n")
-        self.assertEqual(scope_names(lst), ['', 'f#0', '', 'f#0', ''])
-
-    def test_single_trailing_comment(self):
-        lst = [deff(1, 0, 'f'), code(2, 4), comment(3, 0)]
-        whole_pass(lst)
-        self.assertEqual(scope_names(lst), ['', 'f#0', ''])
-
-    def test_comment_at_left_margin_does_not_close_the_function(self):
-        lst = [deff(1, 0, 'f'), code(2, 4), comment(3, 0), blank(4), code(5, 4)]
-        whole_pass(lst)
-        self.assertEqual(scope_names(lst), ['', 'f#0', 'f#0', 'f#0', 'f#0'])
-
-
 class ScopeStartWithoutName(unittest.TestCase):
-
-    def test_body_stays_in_the_enclosing_scope(self):
-        lst = [deff(1, 0, 'f'), logical(['def'], 2, 4, 2), code(3, 8), code(4, 4)]
-        finder, (contents, classes, functions) = whole_pass(lst)
-        self.assertEqual(names(lst), [('', 'f#0'), ('f#0', None), ('f#0', None), ('f#0', None)])
-        self.assertEqual(functions, set(['f#0']))
 
     def test_no_unraisable_noise(self):
         status, out, err = run_python(
