@@ -12,4 +12,3 @@ if [ "${1:-}" = "--sanitize" ]; then
 fi
 cmake -S "$root" -B "$dir" "${args[@]}" "$@" >/dev/null
 cmake --build "$dir" -j2 >/dev/null
-echo "$dir"
