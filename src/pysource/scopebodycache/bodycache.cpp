@@ -238,39 +238,24 @@ PyGetSetDef cache_getset[] = {
 
 // --- Python-visible methods -------------------------------------------------
 
-// Our methods can be reached unbound through the class dict; the fields are
-// only there on instances of the class.
-void requireInstance(PyObject* self, const char* method) {
-    if (PyObject_TypeCheck(self, &BodyCacheType)) return;
-    PyErr_Format(PyExc_TypeError, "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
-                 method, BodyCacheType.tp_name, Py_TYPE(self)->tp_name);
-    py::fail();
-}
-
 PyObject* m_destroy_impl(PyObject* self, PyObject* const*) {
-    requireInstance(self, "_destroy_impl");
     destroyImpl(self);
     return py::Ref::none().release();
 }
 PyObject* m_GetBodyOfScope(PyObject* self, PyObject* const* a) {
-    requireInstance(self, "GetBodyOfScope");
     return getBodyOfScope(self, a[0]).release();
 }
 PyObject* m_Clear(PyObject* self, PyObject* const* a) {
-    requireInstance(self, "Clear");
     clear(self, a[0] ? a[0] : gNames.star);
     return py::Ref::none().release();
 }
 PyObject* m_GetScopeDef(PyObject* self, PyObject* const* a) {
-    requireInstance(self, "GetScopeDef");
     return getScopeDef(self, a[0]).release();
 }
 PyObject* m_FindScopeDef(PyObject* self, PyObject* const* a) {
-    requireInstance(self, "_FindScopeDef");
     return findScopeDef(self, a[0]).release();
 }
 PyObject* m_FindBodyOfScopeDef(PyObject* self, PyObject* const* a) {
-    requireInstance(self, "_FindBodyOfScopeDef");
     return findBodyOfScopeDef(self, a[0]).release();
 }
 

@@ -114,16 +114,6 @@ const PickledClass kScopeBodyCache = {
     },
 };
 
-// Our methods can be reached unbound through the class dict; the fields are
-// only there on instances of the class.
-void requireInstance(const PickledClass& c, PyObject* self, const char* method) {
-    PyTypeObject* type = c.type();
-    if (PyObject_TypeCheck(self, type)) return;
-    PyErr_Format(PyExc_TypeError, "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
-                 method, type->tp_name, Py_TYPE(self)->tp_name);
-    py::fail();
-}
-
 // --- Reduce -------------------------------------------------------------------
 
 // getattr(self, '__dict__', None)
@@ -136,7 +126,6 @@ py::Ref instanceDict(PyObject* self) {
 }
 
 py::Ref reduce(const PickledClass& c, PyObject* self) {
-    requireInstance(c, self, "__reduce__");
     py::Ref fields[kMaxFields];
     bool anyObjectSet = false;
     for (int i = 0; i < c.fieldCount; ++i) {
@@ -198,7 +187,6 @@ void applyState(const PickledClass& c, PyObject* self, PyObject* state) {
 }
 
 void setState(const PickledClass& c, PyObject* self, PyObject* state) {
-    requireInstance(c, self, "__setstate__");
     if (state != Py_None && !PyTuple_CheckExact(state)) raiseExpectedType("tuple", state);
     applyState(c, self, state);
 }
