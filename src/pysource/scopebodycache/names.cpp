@@ -22,14 +22,9 @@ void internNames() {
     gNames.IndexForLineno = intern("IndexForLineno");
     gNames.FindIndexOfLogical = intern("FindIndexOfLogical");
     gNames.LeafScopeNameHasIndex = intern("LeafScopeNameHasIndex");
-    gNames.add = intern("add");
     gNames.dict = intern("__dict__");
     gNames.update = intern("update");
     gNames.startswith = intern("startswith");
-    gNames.destroy_impl = intern("_destroy_impl");
-    gNames.get = intern("get");
-    gNames.clear = intern("clear");
-    gNames.pop = intern("pop");
     gNames.unpickleChangeFinder = intern("__pyx_unpickle_CChangeFinder");
     gNames.unpickleScopeBodyCache = intern("__pyx_unpickle_CScopeBodyCache");
     gNames.GetBodyOfScope = intern("GetBodyOfScope");

@@ -15,14 +15,9 @@ struct Names {
     PyObject* IndexForLineno;
     PyObject* FindIndexOfLogical;
     PyObject* LeafScopeNameHasIndex;
-    PyObject* add;
     PyObject* dict;
     PyObject* update;
     PyObject* startswith;
-    PyObject* destroy_impl;  // "_destroy_impl"
-    PyObject* get;
-    PyObject* clear;
-    PyObject* pop;
     PyObject* unpickleChangeFinder;
     PyObject* unpickleScopeBodyCache;
     PyObject* GetBodyOfScope;

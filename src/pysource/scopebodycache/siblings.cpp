@@ -110,8 +110,7 @@ void bindDestroyableBase() {
 void checkOtherTypes() {
     using contracts::PlainSiblingObject;
     using contracts::VtabSiblingObject;
-    py::Ref builtins = py::check(PyImport_ImportModule("__builtin__"));
-    py::Ref typeType = importType("__builtin__", "type", sizeof(PyHeapTypeObject), false);
+    importType("__builtin__", "type", sizeof(PyHeapTypeObject), false);
     importType(kFastaccess, "CLogger", sizeof(PlainSiblingObject), false);
     importType(kFastaccess, "CBytesTokenizer", sizeof(VtabSiblingObject), true);
     importType(kSymbolinfo, "CSingleResolvedInfo", sizeof(VtabSiblingObject), true);
