@@ -15,6 +15,17 @@ from pysource.scopebodycache import CChangeFinder
 kClassKind, kDefKind, kCommentKind, kBlankKind = 1, 2, 21, 22
 SANITIZED = bool(os.environ.get('SBC_SANITIZED'))
 kMissing = object()
+# A small file with a nested scope, a repeated name and a dedented comment.
+kSampleSource = '''\
+class A:
+    def f(self):
+        pass
+# comment
+    def f(self):
+        x = 1
+def g():
+    return 2
+'''
 
 
 def Logical(tokens, lineno=1, indent=0, kind=0):

@@ -4,18 +4,9 @@ import unittest
 
 from pysource.scopebodycache import CChangeFinder
 
-from support import CapturedStderr, Edit, ImportWith, Names, Outcome, Read, WholeListNames
+from support import (CapturedStderr, Edit, ImportWith, Names, Outcome, Read, WholeListNames,
+                     kSampleSource)
 
-kSource = '''\
-class A:
-    def f(self):
-        pass
-    def f(self):
-        x = 1
-# about g
-def g():
-    return 2
-'''
 kRecursive = 'FindChanges cannot be called recursively'
 kNoLen = "object of type 'NoneType' has no len()"
 kErrors = dict((name, KeyError(name)) for name in ['prepare', 'prepared', 'whole', 'clear'])
@@ -129,7 +120,7 @@ class DriverTest(unittest.TestCase):
             (['base'], "KeyError: 'base'", None)])
 
     def testStrategyByTheCountOfAddedLogicals(self):
-        lst = Read(kSource)
+        lst = Read(kSampleSource)
         functions = set(['A#0.f#0', 'A#0.f#1', 'g#0'])
         expected = (functions | set(['', 'A#0']), set(['A#0']), functions)
         # Only the count of added logicals matters, not what they are.
@@ -138,7 +129,7 @@ class DriverTest(unittest.TestCase):
             finder.calls = []
             self.assertEqual(finder.FindChanges(added, []), expected)
             self.assertEqual(finder.calls, ['prepare', 'removed', 'whole', 'clear'])
-            self.assertEqual(Names(lst), WholeListNames(kSource))
+            self.assertEqual(Names(lst), WholeListNames(kSampleSource))
             for l in lst:
                 l.fScopeName = l.fLocalScopeName = None
         finder = Recorder([])
@@ -146,7 +137,7 @@ class DriverTest(unittest.TestCase):
         self.assertIn('whole', finder.calls)
         # Otherwise the indices the removed step gives go to the added step.
         CChangeFinder(lst).FindChanges(lst, [])
-        added, removed = Edit(lst, kSource.replace('x = 1', 'x = 3'))
+        added, removed = Edit(lst, kSampleSource.replace('x = 1', 'x = 3'))
         finder = Recorder(lst)
         finder.calls = []
         self.assertEqual(finder.FindChanges(added, removed), (set(['A#0.f#1']), set(), set()))
@@ -188,7 +179,7 @@ class DriverTest(unittest.TestCase):
                 (('prepare',), 'prepare', ['prepare'], False),
                 # Prepared, then failed: nothing clears, so the finder stays busy.
                 (('prepared',), 'prepared', ['prepare'], True)]:
-            lst = Read(kSource)
+            lst = Read(kSampleSource)
             finder = Recorder(lst)
             finder.fail, finder.calls = fail, []
             try:
@@ -208,7 +199,7 @@ class DriverTest(unittest.TestCase):
     def testDestroy(self):
         destroyed = []
         finder = type('Finder', (Recorder,), {'_destroy_impl': lambda self: destroyed.append(self)
-                                              or Recorder._destroy_impl(self)})(Read(kSource))
+                                              or Recorder._destroy_impl(self)})(Read(kSampleSource))
         finder._PrepareForFind()
         finder.calls = []
         finder.destroy()

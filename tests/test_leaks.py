@@ -10,26 +10,16 @@ import unittest
 import pysource.scopebodycache as sbc
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache, GetFullNameForScopeDef
 
-from support import CapturedStderr, Logical, Read, SANITIZED, kDefKind
+from support import CapturedStderr, Logical, Read, SANITIZED, kDefKind, kSampleSource
 
 kRepeats = 40 if SANITIZED else 300
-kSource = '''\
-class A:
-    def f(self):
-        pass
-# comment
-    def f(self):
-        x = 1
-def g():
-    return 2
-'''
 SubCache = type('SubCache', (CScopeBodyCache,), {})
 
 
 class LeakTest(unittest.TestCase):
 
     def setUp(self):
-        self.lst = Read(kSource)
+        self.lst = Read(kSampleSource)
         self.finder = CChangeFinder(self.lst)
         self.finder.FindChanges(self.lst, [])
         self.watched = [self.lst, self.finder] + self.lst + [t for l in self.lst for t in l.fTokens]
@@ -104,7 +94,7 @@ class LeakTest(unittest.TestCase):
         self.assertFlat([], (Run, None))
 
     def testFinderErrors(self):
-        lst, tup, bad = self.lst, tuple(self.lst), Read(kSource) + [['not a logical']]
+        lst, tup, bad = self.lst, tuple(self.lst), Read(kSampleSource) + [['not a logical']]
         busy, destroyed = CChangeFinder(lst), CChangeFinder(lst)
         busy._PrepareForFind()
         destroyed._destroy_impl()
