@@ -149,6 +149,17 @@ def TimeTyping(lst, call, at, reps):
     return samples
 
 
+def InsertAndRemove(lst, i, logical, call):
+    """Inserts a logical before index i, then removes it again: the costs of
+    both FindChanges calls."""
+    Shift(lst, i, 1)
+    lst.insert(i, logical)
+    inserted = call([logical], [])
+    del lst[i]
+    Shift(lst, i, -1)
+    return inserted, call([], [logical])
+
+
 def TimeDefLine(lst, call, at, reps):
     i = Find(lst, at, IsMethodHeader)
     inserted, removed = [], []
@@ -156,12 +167,9 @@ def TimeDefLine(lst, call, at, reps):
         ref = lst[i]
         header = LogicalLineType(('def', 'zz_bench', '(', 'self', ')', ':'), ref.fLineno,
                                  ref.fIndent, replay.kDefKind)
-        Shift(lst, i, 1)
-        lst.insert(i, header)
-        inserted.append(call([header], []))
-        del lst[i]
-        Shift(lst, i, -1)
-        removed.append(call([], [header]))
+        cost_in, cost_out = InsertAndRemove(lst, i, header, call)
+        inserted.append(cost_in)
+        removed.append(cost_out)
     return inserted, removed
 
 
@@ -172,12 +180,7 @@ def TimeComment(lst, call, at, reps):
     for _ in range(reps):
         ref = lst[i]
         comment = LogicalLineType(('# note',), ref.fLineno, ref.fIndent, 21)
-        Shift(lst, i, 1)
-        lst.insert(i, comment)
-        samples.append(call([comment], []))
-        del lst[i]
-        Shift(lst, i, -1)
-        samples.append(call([], [comment]))
+        samples.extend(InsertAndRemove(lst, i, comment, call))
     return samples
 
 
