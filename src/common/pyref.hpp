@@ -4,6 +4,7 @@
 
 #include <Python.h>
 
+#include <cassert>
 #include <new>
 #include <utility>
 
@@ -17,20 +18,17 @@ namespace py {
 // Caught at every entry point from the interpreter; never crosses into it.
 struct Error {};
 
-[[noreturn]] inline void fail() { throw Error{}; }
+// Every failure path goes through here, so a failure without an exception
+// (which the interpreter would turn into a SystemError far from its cause)
+// is caught where it happens in debug builds.
+[[noreturn]] inline void fail() {
+    assert(PyErr_Occurred() != nullptr && "failure without a Python exception set");
+    throw Error{};
+}
 
-// A borrowed view: never touches the reference count.
-class Borrowed {
-public:
-    constexpr Borrowed() noexcept = default;
-    constexpr explicit Borrowed(PyObject* o) noexcept : obj_(o) {}
-    PyObject* get() const noexcept { return obj_; }
-    explicit operator bool() const noexcept { return obj_ != nullptr; }
-    bool isNone() const noexcept { return obj_ == Py_None; }
-
-private:
-    PyObject* obj_ = nullptr;
-};
+// Ownership convention: a raw PyObject* parameter or result is borrowed
+// unless the function says otherwise; anything kept past a call that can
+// run Python code is held in a Ref.
 
 // An owning handle. It never converts to PyObject* implicitly: get() lends,
 // release() hands the reference back to the interpreter.
@@ -58,11 +56,9 @@ public:
         Py_XINCREF(o);
         return Ref(o);
     }
-    static Ref own(Borrowed b) noexcept { return own(b.get()); }
     static Ref none() noexcept { return own(Py_None); }
 
     PyObject* get() const noexcept { return obj_; }
-    Borrowed borrow() const noexcept { return Borrowed(obj_); }
     PyObject* release() noexcept {
         PyObject* o = obj_;
         obj_ = nullptr;
@@ -122,29 +118,42 @@ inline void storeSlot(PyObject** slot, PyObject* value) noexcept {
     Py_XDECREF(old);
 }
 
-// Runs `body` and turns the C++ error channel into the interpreter's.
-template <class Body>
-PyObject* guarded(Body&& body) noexcept {
+// The one translation of a C++ exception into the interpreter's: call it
+// inside `catch (...)`. Error already carries a Python exception;
+// bad_alloc becomes MemoryError; anything else is a bug, reported as
+// SystemError rather than ending the process.
+inline void setErrorFromCurrentException() noexcept {
     try {
-        return body();
+        throw;
     } catch (const Error&) {
-        return nullptr;
     } catch (const std::bad_alloc&) {
         PyErr_NoMemory();
-        return nullptr;
+    } catch (...) {
+        PyErr_SetString(PyExc_SystemError, "unexpected C++ exception");
     }
 }
 
-template <class Body>
-int guardedStatus(Body&& body) noexcept {
+// Runs `body`; on failure the Python exception is set and `failed` returned.
+template <class T, class Body>
+T guardedAs(T failed, Body&& body) noexcept {
     try {
         return body();
-    } catch (const Error&) {
-        return -1;
-    } catch (const std::bad_alloc&) {
-        PyErr_NoMemory();
-        return -1;
+    } catch (...) {
+        setErrorFromCurrentException();
+        return failed;
     }
+}
+
+// An entry point returning an object: nullptr on failure.
+template <class Body>
+PyObject* guarded(Body&& body) noexcept {
+    return guardedAs<PyObject*>(nullptr, static_cast<Body&&>(body));
+}
+
+// An entry point returning a status: -1 on failure.
+template <class Body>
+int guardedStatus(Body&& body) noexcept {
+    return guardedAs<int>(-1, static_cast<Body&&>(body));
 }
 
 // Keeps the pending exception aside while cleanup code runs; restores it

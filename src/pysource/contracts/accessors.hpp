@@ -3,6 +3,7 @@
 // implementation of each.
 #pragma once
 
+#include "common/messages.hpp"
 #include "common/pyref.hpp"
 #include "pysource/contracts/logical_record.hpp"
 
@@ -20,7 +21,31 @@ inline bool logicalCheck(PyObject* o) noexcept { return Py_TYPE(o) == gLogicalLi
 inline Logical* asLogical(PyObject* o) noexcept { return reinterpret_cast<Logical*>(o); }
 
 // TypeError "Argument must be a logical" unless `o` is exactly a logical.
-Logical* requireLogical(PyObject* o);
+// The record is borrowed: use it only where no Python code can run.
+inline Logical* requireLogical(PyObject* o) {
+    if (!logicalCheck(o)) msg::raise(PyExc_TypeError, msg::kNotLogical);
+    return asLogical(o);
+}
+
+// An owned logical, checked when it is taken: a record that stays valid
+// across calls that can run Python code (which may empty the list).
+class LogicalRef {
+public:
+    LogicalRef() noexcept = default;
+    // A new reference to `o`; TypeError unless it is exactly a logical.
+    static LogicalRef own(PyObject* o) {
+        requireLogical(o);
+        return LogicalRef(py::Ref::own(o));
+    }
+    Logical* operator->() const noexcept { return asLogical(ref_.get()); }
+    Logical* record() const noexcept { return asLogical(ref_.get()); }
+    PyObject* get() const noexcept { return ref_.get(); }
+    explicit operator bool() const noexcept { return bool(ref_); }
+
+private:
+    explicit LogicalRef(py::Ref ref) noexcept : ref_(std::move(ref)) {}
+    py::Ref ref_;
+};
 
 inline bool isWhitespace(const Logical* l) noexcept {
     return l->fKind == kCommentLogical || l->fKind == kBlankLogical;

@@ -24,4 +24,12 @@ struct DestroyableObject {
 // Attribute of a type's dictionary that holds its native method table.
 inline constexpr const char* kVtableAttr = "__vtable__";
 
+// A class built on CDestroyable keeps its own state block after the base's
+// instance, at an offset fixed at import (the base's size is only known
+// then).
+template <class State>
+inline State& stateAt(PyObject* self, Py_ssize_t offset) noexcept {
+    return *reinterpret_cast<State*>(reinterpret_cast<char*>(self) + offset);
+}
+
 }  // namespace contracts

@@ -24,16 +24,13 @@ namespace {
 
 PyTypeObject BodyCacheType = {PyVarObject_HEAD_INIT(nullptr, 0)};
 
-PyObject* gDot = nullptr;   // "."
-PyObject* gJoin = nullptr;  // "join"
-
 // --- Small helpers with the semantics of the Python operations ------------
 
 // dict.get(key, None) on a field that may be None; a stored None counts as
 // absent. PyDict_GetItem swallows lookup errors in 2.7, so a miss is
 // confirmed by a lookup that reports them.
 py::Ref cacheGet(PyObject* field, PyObject* key) {
-    if (field == Py_None) raiseNoneAttribute("get");
+    if (field == Py_None) msg::raiseNoneAttribute("get");
     py::Ref dict = py::Ref::own(field);
     PyObject* v = PyDict_GetItem(dict.get(), key);
     if (v == nullptr) {
@@ -47,14 +44,14 @@ py::Ref cacheGet(PyObject* field, PyObject* key) {
 // field[key] = value; the field may have been emptied to None by Python code
 // that ran while the value was computed.
 void cacheStore(PyObject* field, PyObject* key, PyObject* value) {
-    if (field == Py_None) raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
+    if (field == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
     py::Ref dict = py::Ref::own(field);
     py::checkStatus(PyDict_SetItem(dict.get(), key, value));
 }
 
 // field.pop(key, None), the result dropped.
 void cachePop(PyObject* field, PyObject* key) {
-    if (field == Py_None) raiseNoneAttribute("pop");
+    if (field == Py_None) msg::raiseNoneAttribute("pop");
     py::Ref dict = py::Ref::own(field);
     if (py::checkStatus(PyDict_Contains(dict.get(), key)) == 0) return;
     if (PyDict_DelItem(dict.get(), key) < 0) {
@@ -65,7 +62,7 @@ void cachePop(PyObject* field, PyObject* key) {
 }
 
 void cacheClear(PyObject* field) {
-    if (field == Py_None) raiseNoneAttribute("clear");
+    if (field == Py_None) msg::raiseNoneAttribute("clear");
     py::Ref dict = py::Ref::own(field);
     PyDict_Clear(dict.get());
 }
@@ -122,8 +119,7 @@ py::Ref parentScopeName(PyObject* parts, Py_ssize_t count) {
     if (count == 1) return py::Ref::own(gNames.empty);
     if (count == 2) return py::check(PySequence_GetItem(parts, 0));
     py::Ref ancestors = py::check(PySequence_GetSlice(parts, 0, count - 1));
-    py::Ref dot = py::Ref::own(gDot);
-    return py::check(PyObject_CallMethodObjArgs(dot.get(), gJoin, ancestors.get(), nullptr));
+    return py::check(PyObject_CallMethodObjArgs(gNames.dot, gNames.join, ancestors.get(), nullptr));
 }
 
 py::Ref findScopeDef(PyObject* self, PyObject* scopeName) {
@@ -144,7 +140,7 @@ py::Ref findScopeDef(PyObject* self, PyObject* scopeName) {
         found = py::Ref::own(logical);
         return false;
     });
-    if (!found) raiseWithRepr(PyExc_KeyError, msg::kNoScopeFound, scopeName);
+    if (!found) msg::raiseWithRepr(PyExc_KeyError, msg::kNoScopeFound, scopeName);
     return found;
 }
 
@@ -153,22 +149,22 @@ py::Ref findBodyOfScopeDef(PyObject* self, PyObject* scopeDef) {
     long defIndent = -1;
     if (scopeDef != Py_None) {
         const Logical* def = requireLogical(scopeDef);
-        if (!isScopeStart(def)) raiseWithRepr(PyExc_ValueError, msg::kMustStartScope, scopeDef);
+        if (!isScopeStart(def)) msg::raiseWithRepr(PyExc_ValueError, msg::kMustStartScope, scopeDef);
         py::Ref list = py::Ref::own(bodyCacheState(self).logicalList);
         first = findIndexOfLogical(list.get(), scopeDef) + 1;
-        if (first == 0) raise(PyExc_IndexError, msg::kDefNotInList);
+        if (first == 0) msg::raise(PyExc_IndexError, msg::kDefNotInList);
         defIndent = def->fIndent;
     }
 
     py::Ref list = py::Ref::own(bodyCacheState(self).logicalList);
-    if (list.isNone()) raise(PyExc_TypeError, msg::kNoneHasNoLen);
+    if (list.isNone()) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
     const Py_ssize_t end = PyList_GET_SIZE(list.get());
     py::Ref body = py::check(PyList_New(0));
     long nestedIndent = -1;  // -1: not inside a nested class or def
     // No Python code runs in this loop, but the length was taken once: a
     // list that shrank since is an IndexError as for list[i].
     for (Py_ssize_t i = first; i < end; ++i) {
-        if (i >= PyList_GET_SIZE(list.get())) raise(PyExc_IndexError, "list index out of range");
+        if (i >= PyList_GET_SIZE(list.get())) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
         PyObject* logical = PyList_GET_ITEM(list.get(), i);
         const Logical* l = requireLogical(logical);
         if (isWhitespace(l)) continue;
@@ -208,12 +204,12 @@ void clear(PyObject* self, PyObject* scopeNames) {
 
 // --- Type slots -------------------------------------------------------------
 
-using Slots = DestroyableSubclass<BodyCacheState, &gBodyCacheStateOffset, &BodyCacheState::logicalList,
-                                  &BodyCacheState::scopeBodyCache, &BodyCacheState::scopeDefCache>;
+using Slots = DestroyableSubclass<BodyCacheState, &gBodyCacheStateOffset>;
 
 int cache_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
-        setBodyCacheLogicalList(self, initDestroyableSubclass(self, args, kwargs));
+        storeTyped(&bodyCacheState(self).logicalList, initDestroyableSubclass(self, args, kwargs),
+                   &PyList_Type, "list");
         BodyCacheState& s = bodyCacheState(self);
         py::Ref bodies = py::check(PyDict_New());
         py::storeSlot(&s.scopeBodyCache, bodies.get());
@@ -278,19 +274,7 @@ const FunctionSpec kMethods[] = {
 
 PyTypeObject* scopeBodyCacheType() noexcept { return &BodyCacheType; }
 
-void setBodyCacheLogicalList(PyObject* self, PyObject* value) {
-    if (value != Py_None && !PyList_CheckExact(value)) raiseExpectedType("list", value);
-    py::storeSlot(&bodyCacheState(self).logicalList, value);
-}
-
-void setBodyCacheDict(PyObject** field, PyObject* value) {
-    if (value != Py_None && !PyDict_CheckExact(value)) raiseExpectedType("dict", value);
-    py::storeSlot(field, value);
-}
-
 void readyScopeBodyCacheType() {
-    gDot = py::check(PyString_InternFromString(".")).release();
-    gJoin = py::check(PyString_InternFromString("join")).release();
     BodyCacheType.tp_name = "pysource.scopebodycache.CScopeBodyCache";
     Slots::fillType(BodyCacheType);
     BodyCacheType.tp_init = cache_init;
@@ -298,13 +282,6 @@ void readyScopeBodyCacheType() {
     py::checkStatus(PyType_Ready(&BodyCacheType));
 }
 
-void bindScopeBodyCacheMethods() {
-    PyObject* dict = BodyCacheType.tp_dict;
-    for (const FunctionSpec& spec : kMethods) {
-        py::Ref f = newMethod(spec, &BodyCacheType, "pysource.scopebodycache");
-        py::checkStatus(PyDict_SetItemString(dict, spec.name, f.get()));
-    }
-    PyType_Modified(&BodyCacheType);
-}
+void bindScopeBodyCacheMethods() { bindMethods(&BodyCacheType, kMethods, kModuleName); }
 
 }  // namespace sbc

@@ -3,28 +3,39 @@
 #pragma once
 
 #include "common/pyref.hpp"
+#include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/fields.hpp"
 
 namespace sbc {
 
+// The pickled fields after the base class's two, in the order of the state
+// tuple (sorted by name). Fixed by stored pickles: never rename, reorder or
+// add to them. See fields.hpp.
+#define SBC_BODY_CACHE_FIELDS(X)                                            \
+    X(Object, logicalList, "_fLogicalList", list)                           \
+    X(Object, scopeBodyCache, "_fScopeBodyCache", dict)                     \
+    X(Object, scopeDefCache, "_fScopeDefCache", dict)
+
 struct BodyCacheState {
-    PyObject* logicalList;     // list or None
-    PyObject* scopeBodyCache;  // dict or None: full name -> body list
-    PyObject* scopeDefCache;   // dict or None: full name -> scope def
+    // logicalList: the list or None; scopeBodyCache: full name -> body
+    // list; scopeDefCache: full name -> scope def.
+    SBC_BODY_CACHE_FIELDS(SBC_FIELD_MEMBER)
+
+    template <class Visit>
+    void forEachObject(Visit&& visit) {
+        SBC_BODY_CACHE_FIELDS(SBC_FIELD_VISIT)
+    }
 };
 
 // Our fields follow whatever instance size the base class has at import.
 extern Py_ssize_t gBodyCacheStateOffset;
 
 inline BodyCacheState& bodyCacheState(PyObject* self) noexcept {
-    return *reinterpret_cast<BodyCacheState*>(reinterpret_cast<char*>(self) + gBodyCacheStateOffset);
+    return contracts::stateAt<BodyCacheState>(self, gBodyCacheStateOffset);
 }
 
 PyTypeObject* scopeBodyCacheType() noexcept;
 void readyScopeBodyCacheType();
 void bindScopeBodyCacheMethods();
-
-// Field stores with the type rules of the fields ("Expected list, got X").
-void setBodyCacheLogicalList(PyObject* self, PyObject* value);
-void setBodyCacheDict(PyObject** field, PyObject* value);  // exact dict or None
 
 }  // namespace sbc

@@ -10,11 +10,11 @@
 
 namespace sbc {
 
-template <class State, Py_ssize_t* Offset, PyObject* State::*... Fields>
+// State: the class's state block, with forEachObject(visit) over its
+// object fields (fields.hpp); Offset: where the block starts.
+template <class State, Py_ssize_t* Offset>
 struct DestroyableSubclass {
-    static State& state(PyObject* self) noexcept {
-        return *reinterpret_cast<State*>(reinterpret_cast<char*>(self) + *Offset);
-    }
+    static State& state(PyObject* self) noexcept { return contracts::stateAt<State>(self, *Offset); }
 
     // Places the fields after the base; returns the instance size.
     static Py_ssize_t layout() noexcept {
@@ -27,14 +27,19 @@ struct DestroyableSubclass {
     static PyObject* tp_new(PyTypeObject* type, PyObject* args, PyObject* kwargs) {
         PyObject* self = gDestroyableType->tp_new(type, args, kwargs);
         if (self == nullptr) return nullptr;
-        State& s = state(self);
-        ((Py_INCREF(Py_None), s.*Fields = Py_None), ...);
+        state(self).forEachObject([](PyObject*& field) {
+            Py_INCREF(Py_None);
+            field = Py_None;
+        });
         return self;
     }
 
     static int tp_traverse(PyObject* self, visitproc visit, void* arg) {
-        State& s = state(self);
-        for (PyObject* field : {s.*Fields...}) Py_VISIT(field);
+        int status = 0;
+        state(self).forEachObject([&](PyObject* field) {
+            if (status == 0 && field != nullptr) status = visit(field, arg);
+        });
+        if (status != 0) return status;
         if (baseSlotsChain()) {
             return gDestroyableType->tp_traverse ? gDestroyableType->tp_traverse(self, visit, arg) : 0;
         }
@@ -43,8 +48,7 @@ struct DestroyableSubclass {
     }
 
     static int tp_clear(PyObject* self) {
-        State& s = state(self);
-        (py::storeSlot(&(s.*Fields), Py_None), ...);
+        state(self).forEachObject([](PyObject*& field) { py::storeSlot(&field, Py_None); });
         if (baseSlotsChain()) return gDestroyableType->tp_clear ? gDestroyableType->tp_clear(self) : 0;
         py::storeSlot(&base(self)->fSignalCatchers, Py_None);
         return 0;
@@ -52,8 +56,7 @@ struct DestroyableSubclass {
 
     static void tp_dealloc(PyObject* self) {
         PyObject_GC_UnTrack(self);
-        State& s = state(self);
-        (clearField(&(s.*Fields)), ...);
+        state(self).forEachObject([](PyObject*& field) { Py_CLEAR(field); });
         if (baseSlotsChain()) {
             gDestroyableType->tp_dealloc(self);
             return;
@@ -73,8 +76,6 @@ struct DestroyableSubclass {
     }
 
 private:
-    static void clearField(PyObject** field) noexcept { Py_CLEAR(*field); }
-
     // A heap-type base (a Python class given in place of CDestroyable) has
     // subtype_* slots that start again from the instance's type; chaining
     // to them would come back here.

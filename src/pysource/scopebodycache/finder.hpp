@@ -1,10 +1,13 @@
 // CChangeFinder: keeps fScopeName of every logical and fLocalScopeName of
 // every class/def logical right while the caller edits the logical list.
 //
-// Invariants the passes keep (checked by debug-only assertions where cheap):
+// What is true between and during calls
+// -------------------------------------
 // - Between FindChanges calls the finder is idle: change sets and the
 //   scopes-seen table are None, _fEndIndexForScopesSeen is 0,
-//   _fNextChangeIndex and _fLastProcessedIndex are -1.
+//   _fNextChangeIndex and _fLastProcessedIndex are -1, and every logical
+//   carries the names a whole-list pass would give it. FindChanges checks
+//   the idle state at entry and exit in debug builds (checkIdle).
 // - While the incremental pass visits index i, every logical before i
 //   carries the names a whole-list pass would give it, _fNextChangeIndex is
 //   the next index that will be visited (forward scans stop there) and
@@ -19,26 +22,74 @@
 //   indented no deeper than that line, else the scope its own look-back
 //   finds; a trailing run with no code after it is placed as if a
 //   module-level line followed.
+//
+// assertThat() is the `assert` statement of the steps: it raises
+// AssertionError (no message) and is skipped when the interpreter runs
+// optimised (-O). It guards callers' input, so it never stands in for a
+// check the module's own state needs. Checks of the module's own state are
+// C-level (assert(), compiled in with NDEBUG off, as in the sanitizer build).
+//
+// Where Python code can run during a pass
+// ---------------------------------------
+// Any of these can change the list, the finder, or the arguments:
+// 1. an override of a step in a Python subclass, or an instance attribute
+//    standing in for one (every route:: call);
+// 2. the siblings' Python-level functions, looked up through the module
+//    globals `_fastaccess` and `symbolinfo` at each use (IndexForLineno,
+//    FindIndexOfLogical, LeafScopeNameHasIndex), which Python may rebind;
+// 3. the module global GetFullNameForScopeDef when it is rebound;
+// 4. the symbol-info entry points, which may look for a Python-level
+//    override of their own;
+// 5. rich compares and hashing of names that are not exact str (sets,
+//    dicts, ==), and the `startswith` of a name that is not a str;
+// 6. the release of an old name in storeSlot (the object may have a
+//    finalizer), and any allocation of a container, which may start a
+//    garbage collection that runs finalizers.
+// After each of them the pass re-checks instead of trusting what it read
+// before: list items are read by index against the live length (logicalAt
+// raises IndexError past the end) and held as LogicalRef across the call;
+// the change sets, the table and the indices are read from the finder
+// state afresh at each use (a set emptied to None by _Clear fails as
+// Python would, with AttributeError); a nested FindChanges is refused
+// while a call is in progress; and whatever ends the call, the finder is
+// left idle.
 #pragma once
 
+#include "common/messages.hpp"
 #include "common/pyref.hpp"
 #include "pysource/contracts/accessors.hpp"
+#include "pysource/contracts/destroyable_base.hpp"
+#include "pysource/scopebodycache/fields.hpp"
 
 namespace sbc {
 
+// The pickled fields of a finder, after the base class's two, in the order
+// of the state tuple (sorted by name). The Python-visible names, this order
+// and the checksum that names it are fixed by stored pickles and by the
+// callers that read them: never rename, reorder or add to them (a new field
+// goes into the internal part of FinderState). See fields.hpp.
+#define SBC_FINDER_FIELDS(X)                                                \
+    X(Object, classChanges, "_fCurrentClassChanges", set)                   \
+    X(Object, contentsChanges, "_fCurrentContentsChanges", set)             \
+    X(Object, functionChanges, "_fCurrentFunctionChanges", set)             \
+    X(Index, endIndexForScopesSeen, "_fEndIndexForScopesSeen", index)       \
+    X(Index, lastProcessedIndex, "_fLastProcessedIndex", index)             \
+    X(Object, logicalList, "_fLogicalList", list)                           \
+    X(Index, nextChangeIndex, "_fNextChangeIndex", index)                   \
+    X(Object, scopesSeen, "_fScopesSeen", dict)
+
 struct FinderState {
-    PyObject* logicalList;           // list or None
-    PyObject* classChanges;          // set or None
-    PyObject* functionChanges;       // set or None
-    PyObject* contentsChanges;       // set or None; not None marks a call in progress
-    PyObject* scopesSeen;            // dict or None
-    Py_ssize_t endIndexForScopesSeen;
-    Py_ssize_t nextChangeIndex;
-    Py_ssize_t lastProcessedIndex;
-    // Not a Python-visible field: the least indent among the logicals a
-    // forward scan changed before _fNextChangeIndex cut it short (kNoScanOwed
-    // when none). The next visit carries that scan on.
+    SBC_FINDER_FIELDS(SBC_FIELD_MEMBER)
+    // Internal, never pickled: the least indent among the logicals a
+    // forward scan changed before _fNextChangeIndex cut it short
+    // (kNoScanOwed when none). The next visit carries that scan on.
     long owedScanIndent;
+
+    // Each object field, for the slots (allocation, gc, deallocation).
+    template <class Visit>
+    void forEachObject(Visit&& visit) {
+        SBC_FINDER_FIELDS(SBC_FIELD_VISIT)
+    }
 };
 
 inline constexpr long kNoScanOwed = 1L << 20;
@@ -47,32 +98,37 @@ inline constexpr long kNoScanOwed = 1L << 20;
 extern Py_ssize_t gFinderStateOffset;
 
 inline FinderState& finderState(PyObject* self) noexcept {
-    return *reinterpret_cast<FinderState*>(reinterpret_cast<char*>(self) + gFinderStateOffset);
+    return contracts::stateAt<FinderState>(self, gFinderStateOffset);
 }
 
 PyTypeObject* changeFinderType() noexcept;
 void readyChangeFinderType();
 void bindChangeFinderMethods();
 
-// Field stores with the type rules of the fields.
-void setLogicalList(PyObject* self, PyObject* value);
-void setChangeSet(PyObject** field, PyObject* value);
-void setScopesSeen(PyObject* self, PyObject* value);
+inline void setLogicalList(PyObject* self, PyObject* value) {
+    storeTyped(&finderState(self).logicalList, value, &PyList_Type, "list");
+}
 
 // Shared helpers of the passes.
 bool assertionsOn() noexcept;
-void assertThat(bool condition);  // AssertionError without a message
+void assertThat(bool condition);  // the assert statement: see above
 Py_ssize_t logicalListLength(PyObject* self);
-// list[i] with ordinary list indexing, owned: Python code may shrink the list.
-py::Ref logicalAt(PyObject* self, Py_ssize_t i);
+// list[i] with ordinary list indexing, checked to be a logical and owned:
+// Python code may shrink the list while it is in use.
+contracts::LogicalRef logicalAt(PyObject* self, Py_ssize_t i);
+// `assert self._fLogicalList[i] is logical`, evaluated only when assertions
+// are on, like the statement it stands for.
+void assertListItemIs(PyObject* self, Py_ssize_t i, PyObject* logical);
 void addChange(PyObject* set, PyObject* name);
 // A scope name about to be stored or used: str or None, else TypeError.
 void requireStrOrNone(PyObject* name);
-// The first two items of a split scope name (bare name, index).
-void unpackTwo(PyObject* seq, py::Ref* first, py::Ref* second);
+// `a, b = seq` (exactly two items) or, with firstTwo, `a, b = seq[:2]`.
+void unpackPair(PyObject* seq, py::Ref* first, py::Ref* second, bool firstTwo = false);
 
-// The steps. Python-visible ones are overridable: route:: calls reach a
-// subclass override, finder:: runs the built-in step.
+// The built-in steps. Python-visible ones are overridable: the passes call
+// them through route:: (route.hpp), which reaches a subclass override.
+// Steps that never raise are written here as raising bodies; route:: adds
+// the report through the unraisable hook.
 namespace finder {
 void Clear(PyObject* self);
 void PrepareForFind(PyObject* self);
@@ -82,20 +138,16 @@ void FindChangesEntireListAdded(PyObject* self);
 py::Ref GetLeafScopeWithIndex(PyObject* self, PyObject* logical, Py_ssize_t scopeIndex);
 py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList);
 void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices);
-Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first) noexcept;
-Py_ssize_t ProcessDedentedCommentsBody(PyObject* self, Py_ssize_t first);
+Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first);
 void LogicalInScopeChanged(PyObject* self, PyObject* logical, PyObject* scopeName,
                            PyObject* oldContainingScope, PyObject* oldLeafScope);
 bool SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName,
                           PyObject* localName);
-// `a, b = pair` as the interpreter does it.
-void unpackPair(PyObject* pair, py::Ref* first, py::Ref* second);
 py::Ref UpdateLogicalScopeName(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
 void UpdateContainingScope(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
 void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName,
                                       PyObject* newScopeName, Py_ssize_t start, Py_ssize_t end);
-Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logical, Py_ssize_t i) noexcept;
-Py_ssize_t FindScopeIndexForLogicalBody(PyObject* self, PyObject* logical, Py_ssize_t i);
+Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logical, Py_ssize_t i);
 py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i);
 
 // Internal steps, not visible to Python.
@@ -103,28 +155,7 @@ void ProcessNonDedentedComment(PyObject* self, PyObject* logical, Py_ssize_t i);
 void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedIndent);
 void UpdateScopesSeen(PyObject* self, Py_ssize_t end);
 Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logical,
-                                                 PyObject* scopeName, bool nameIsBare) noexcept;
+                                                 PyObject* scopeName, bool nameIsBare);
 }  // namespace finder
-
-namespace route {
-void Clear(PyObject* self);
-void PrepareForFind(PyObject* self);
-void FindChangesEntireListAdded(PyObject* self);
-py::Ref GetLeafScopeWithIndex(PyObject* self, PyObject* logical, Py_ssize_t scopeIndex);
-py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList);
-void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices);
-Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first) noexcept;
-void LogicalInScopeChanged(PyObject* self, PyObject* logical, PyObject* scopeName,
-                           PyObject* oldContainingScope = Py_None, PyObject* oldLeafScope = Py_None);
-// An override gets the names as one pair.
-void SetLogicalScopeNames(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName,
-                          PyObject* localName);
-void UpdateLogicalScopeName(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
-void UpdateContainingScope(PyObject* self, PyObject* logical, Py_ssize_t i, PyObject* scopeName);
-void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName,
-                                      PyObject* newScopeName, Py_ssize_t start, Py_ssize_t end);
-Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logical, Py_ssize_t i) noexcept;
-py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i);
-}  // namespace route
 
 }  // namespace sbc

@@ -1,6 +1,6 @@
 // Removed logicals and the recording of changes into the three change sets.
 #include "pysource/scopebodycache/finder.hpp"
-#include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
 namespace sbc::finder {
@@ -8,15 +8,14 @@ namespace sbc::finder {
 using namespace contracts;
 
 py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList) {
-    if (removedList == Py_None) raise(PyExc_TypeError, msg::kNoneNotIterable);
+    if (removedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
     py::Ref result = py::check(PyList_New(0));
     Py_ssize_t lastIndex = -1;
     for (Py_ssize_t k = 0; k < PyList_GET_SIZE(removedList); ++k) {
-        py::Ref item = py::Ref::own(PyList_GET_ITEM(removedList, k));
-        Logical* logical = requireLogical(item.get());
-        py::Ref scope = py::Ref::own(scopeName(logical));
+        LogicalRef logical = LogicalRef::own(PyList_GET_ITEM(removedList, k));
+        py::Ref scope = py::Ref::own(scopeName(logical.record()));
         if (scope.isNone()) continue;
-        route::LogicalInScopeChanged(self, item.get(), scope.get());
+        route::LogicalInScopeChanged(self, logical.get(), scope.get());
         Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno);
         // A logical removed from the end of the list still moves the comment
         // and blank lines before it (they took their scope from it): the last
@@ -37,11 +36,10 @@ void LogicalInScopeChanged(PyObject* self, PyObject* logicalObj, PyObject* scope
     FinderState& s = finderState(self);
     addChange(s.contentsChanges, scopeName);
     if (oldContainingScope != Py_None) addChange(s.contentsChanges, oldContainingScope);
-    Logical* logical = requireLogical(logicalObj);
-    if (!isScopeStart(logical)) return;
-    py::Ref keep = py::Ref::own(logicalObj);
+    LogicalRef logical = LogicalRef::own(logicalObj);
+    if (!isScopeStart(logical.record())) return;
     const bool isClass = logical->fKind == kClassLogical;
-    py::Ref defined = py::Ref::own(localScopeDefinedChecked(logical));
+    py::Ref defined = py::Ref::own(localScopeDefinedChecked(logical.record()));
     if (defined) {
         py::Ref full = joinTwoScopeNames(scopeName, defined.get());
         addChange(isClass ? s.classChanges : s.functionChanges, full.get());

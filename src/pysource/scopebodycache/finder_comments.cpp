@@ -3,7 +3,7 @@
 // that line; then it gets the scope its own look-back finds.
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/names.hpp"
-#include "pysource/scopebodycache/report.hpp"
+#include "pysource/scopebodycache/route.hpp"
 
 namespace sbc::finder {
 
@@ -29,19 +29,15 @@ private:
 
 }  // namespace
 
-Py_ssize_t ProcessDedentedCommentsBody(PyObject* self, Py_ssize_t first) {
-    if (assertionsOn()) {
-        py::Ref at = logicalAt(self, first);
-        assertThat(isWhitespace(requireLogical(at.get())));
-    }
+Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first) {
+    if (assertionsOn()) assertThat(isWhitespace(logicalAt(self, first).record()));
     const Py_ssize_t n = logicalListLength(self);
     // The following logical: the first code line after the run. A run that
     // reaches the end of the list has none and is placed as if a
     // module-level line followed it.
     Py_ssize_t end = n;
     for (Py_ssize_t k = first + 1; k < n; ++k) {
-        py::Ref at = logicalAt(self, k);
-        if (!isWhitespace(requireLogical(at.get()))) {
+        if (!isWhitespace(logicalAt(self, k).record())) {
             end = k;
             break;
         }
@@ -50,25 +46,18 @@ Py_ssize_t ProcessDedentedCommentsBody(PyObject* self, Py_ssize_t first) {
     int referenceIndent = 0;
     py::Ref baseScope = py::Ref::own(gNames.empty);
     if (end < n) {
-        py::Ref following = logicalAt(self, end);
-        referenceIndent = requireLogical(following.get())->fIndent;
+        referenceIndent = logicalAt(self, end)->fIndent;
         baseScope = route::FindScopeNameContainingLogical(self, end);
     }
     for (Py_ssize_t j = first; j < end; ++j) {
-        py::Ref member = logicalAt(self, j);
-        Logical* logical = requireLogical(member.get());
-        py::Ref scope = logical->fIndent > referenceIndent
+        LogicalRef member = logicalAt(self, j);
+        py::Ref scope = member->fIndent > referenceIndent
                             ? route::FindScopeNameContainingLogical(self, j)
                             : baseScope.copy();
         requireStrOrNone(scope.get());
         route::UpdateContainingScope(self, member.get(), j, scope.get());
     }
     return end;
-}
-
-Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first) noexcept {
-    return neverRaises("pysource.scopebodycache.CChangeFinder._ProcessDedentedComments",
-                       Py_ssize_t(0), [&] { return ProcessDedentedCommentsBody(self, first); });
 }
 
 }  // namespace sbc::finder

@@ -1,8 +1,14 @@
 // The finder's life cycle and the FindChanges driver.
+#include "common/messages.hpp"
+#include "pysource/scopebodycache/dispatch.hpp"
 #include "pysource/scopebodycache/finder.hpp"
-#include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/route.hpp"
+
+#include <cassert>
 
 namespace sbc {
+
+using namespace contracts;
 
 bool assertionsOn() noexcept { return Py_OptimizeFlag == 0; }
 
@@ -15,29 +21,92 @@ void assertThat(bool condition) {
 
 Py_ssize_t logicalListLength(PyObject* self) {
     PyObject* list = finderState(self).logicalList;
-    if (list == Py_None) raise(PyExc_TypeError, msg::kNoneHasNoLen);
+    if (list == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
     return PyList_GET_SIZE(list);
 }
 
-py::Ref logicalAt(PyObject* self, Py_ssize_t i) {
+// Item i of the list, owned, with ordinary list indexing.
+py::Ref listItem(PyObject* self, Py_ssize_t i) {
     PyObject* list = finderState(self).logicalList;
-    if (list == Py_None) raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
+    if (list == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
     const Py_ssize_t n = PyList_GET_SIZE(list);
     const Py_ssize_t at = i < 0 ? i + n : i;
-    if (at < 0 || at >= n) raise(PyExc_IndexError, "list index out of range");
+    if (at < 0 || at >= n) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
     return py::Ref::own(PyList_GET_ITEM(list, at));
 }
 
+LogicalRef logicalAt(PyObject* self, Py_ssize_t i) { return LogicalRef::own(listItem(self, i).get()); }
+
+void assertListItemIs(PyObject* self, Py_ssize_t i, PyObject* logical) {
+    if (assertionsOn()) assertThat(listItem(self, i).get() == logical);
+}
+
 void addChange(PyObject* set, PyObject* name) {
-    if (set == Py_None) raiseNoneAttribute("add");
+    if (set == Py_None) msg::raiseNoneAttribute("add");
+    // Hashing a name that is not a str runs Python code, which may drop
+    // the finder's reference to the set.
+    py::Ref keep = py::Ref::own(set);
     py::checkStatus(PySet_Add(set, name));
 }
 
 void requireStrOrNone(PyObject* name) {
-    if (name != Py_None && !PyString_CheckExact(name)) raiseExpectedType("str", name);
+    if (name != Py_None && !PyString_CheckExact(name)) msg::raiseExpectedType("str", name);
+}
+
+void unpackPair(PyObject* seq, py::Ref* first, py::Ref* second, bool firstTwo) {
+    if (PyTuple_CheckExact(seq) || PyList_CheckExact(seq)) {
+        const Py_ssize_t n = PySequence_Fast_GET_SIZE(seq);
+        if (n < 2 || (n > 2 && !firstTwo)) msg::raiseUnpackCount(n);
+        *first = py::Ref::own(PySequence_Fast_GET_ITEM(seq, 0));
+        *second = py::Ref::own(PySequence_Fast_GET_ITEM(seq, 1));
+        return;
+    }
+    if (firstTwo) {
+        // seq[:2], as the split of a scope name is taken.
+        if (seq == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
+        py::Ref head = py::check(PySequence_GetSlice(seq, 0, 2));
+        py::Ref items = py::check(PySequence_Tuple(head.get()));
+        unpackPair(items.get(), first, second);
+        return;
+    }
+    py::Ref iter = py::check(PyObject_GetIter(seq));
+    py::Ref items[3];
+    Py_ssize_t n = 0;
+    for (; n < 3; ++n) {
+        items[n] = py::Ref::steal(PyIter_Next(iter.get()));
+        if (!items[n]) break;
+    }
+    if (PyErr_Occurred()) py::fail();
+    if (n != 2) msg::raiseUnpackCount(n);
+    *first = std::move(items[0]);
+    *second = std::move(items[1]);
 }
 
 namespace finder {
+
+namespace {
+
+// C-level checks of the driver's own work, compiled in where NDEBUG is off
+// (the sanitizer build). An override of _PrepareForFind or _Clear may leave
+// any state, and so may __setstate__ before a call: only what the built-in
+// steps leave is checked.
+[[maybe_unused]] bool isIdle(PyObject* self) noexcept {
+    const FinderState& s = finderState(self);
+    return s.classChanges == Py_None && s.functionChanges == Py_None &&
+           s.contentsChanges == Py_None && s.scopesSeen == Py_None && s.endIndexForScopesSeen == 0 &&
+           s.nextChangeIndex == -1 && s.lastProcessedIndex == -1 && s.owedScanIndent == kNoScanOwed;
+}
+
+[[maybe_unused]] bool isPrepared(PyObject* self) noexcept {
+    const FinderState& s = finderState(self);
+    return (Py_TYPE(s.classChanges) == &PySet_Type) && PySet_GET_SIZE(s.classChanges) == 0 &&
+           (Py_TYPE(s.functionChanges) == &PySet_Type) && PySet_GET_SIZE(s.functionChanges) == 0 &&
+           (Py_TYPE(s.contentsChanges) == &PySet_Type) && PySet_GET_SIZE(s.contentsChanges) == 0 &&
+           PyDict_CheckExact(s.scopesSeen) && PyDict_Size(s.scopesSeen) == 0 &&
+           s.endIndexForScopesSeen == 0 && s.nextChangeIndex == -1 && s.lastProcessedIndex == -1;
+}
+
+}  // namespace
 
 void Clear(PyObject* self) {
     FinderState& s = finderState(self);
@@ -72,14 +141,42 @@ void DestroyImpl(PyObject* self) {
 
 namespace {
 
-Py_ssize_t lengthOf(PyObject* list) {
-    if (list == Py_None) raise(PyExc_TypeError, msg::kNoneHasNoLen);
-    return PyList_GET_SIZE(list);
-}
+// Runs _Clear on every way out of FindChanges. On the way out of a failure
+// the pending exception is set aside while _Clear runs and raised again
+// unless _Clear raised one of its own.
+class ClearOnExit {
+public:
+    explicit ClearOnExit(PyObject* self) noexcept : self_(self) {}
+    ClearOnExit(const ClearOnExit&) = delete;
+    ClearOnExit& operator=(const ClearOnExit&) = delete;
+
+    // The success path: a failing _Clear fails the call.
+    void finish() {
+        done_ = true;
+        route::Clear(self_);
+    }
+
+    ~ClearOnExit() {
+        if (done_) return;
+        py::SavedError pending;
+        try {
+            route::Clear(self_);
+            assert(mayOverride(self_, Step::Clear) || isIdle(self_));
+            pending.restore();
+        } catch (...) {
+            py::setErrorFromCurrentException();  // replaces the pending one
+        }
+    }
+
+private:
+    PyObject* self_;
+    bool done_ = false;
+};
 
 py::Ref findChangesGuarded(PyObject* self, PyObject* addedList, PyObject* removedList) {
     FinderState& s = finderState(self);
-    const Py_ssize_t added = lengthOf(addedList);
+    if (addedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
+    const Py_ssize_t added = PyList_GET_SIZE(addedList);
     const Py_ssize_t total = logicalListLength(self);
     if (added == total) {
         route::ProcessRemovedLogicals(self, removedList);
@@ -87,13 +184,11 @@ py::Ref findChangesGuarded(PyObject* self, PyObject* addedList, PyObject* remove
     } else {
         py::Ref indices = route::ProcessRemovedLogicals(self, removedList);
         if (!indices.isNone() && !PyList_CheckExact(indices.get())) {
-            raiseExpectedType("list", indices.get());
+            msg::raiseExpectedType("list", indices.get());
         }
         route::ProcessAddedLogicals(self, addedList, indices.get());
-        PyObject* classes = s.classChanges;
-        const bool scopesChanged =
-            py::checkSize(PyObject_Size(classes)) != 0 ||
-            py::checkSize(PyObject_Size(s.functionChanges)) != 0;
+        const bool scopesChanged = py::checkSize(PyObject_Size(s.classChanges)) != 0 ||
+                                   py::checkSize(PyObject_Size(s.functionChanges)) != 0;
         if (scopesChanged) {
             const Py_ssize_t n = logicalListLength(self);
             s.nextChangeIndex = n;
@@ -113,26 +208,18 @@ py::Ref findChangesGuarded(PyObject* self, PyObject* addedList, PyObject* remove
 }  // namespace
 
 py::Ref FindChanges(PyObject* self, PyObject* addedList, PyObject* removedList) {
-    if (finderState(self).contentsChanges != Py_None) raise(PyExc_ValueError, msg::kRecursive);
+    if (finderState(self).contentsChanges != Py_None) msg::raise(PyExc_ValueError, msg::kRecursive);
+    // The finder must outlive the call, whatever the steps' overrides drop.
+    py::Ref keepSelf = py::Ref::own(self);
     route::PrepareForFind(self);
-    // The finder's reference must not outlive the call, whatever happens.
-    py::Ref keepAlive = py::Ref::own(self);
+    assert(mayOverride(self, Step::PrepareForFind) || isPrepared(self));
     py::Ref result;
-    try {
+    {
+        ClearOnExit clear(self);
         result = findChangesGuarded(self, addedList, removedList);
-    } catch (const py::Error&) {
-        py::SavedError pending;
-        route::Clear(self);  // its own error replaces the pending one
-        pending.restore();
-        throw;
-    } catch (const std::bad_alloc&) {
-        PyErr_NoMemory();
-        py::SavedError pending;
-        route::Clear(self);
-        pending.restore();
-        throw py::Error{};
+        clear.finish();
     }
-    route::Clear(self);
+    assert(mayOverride(self, Step::Clear) || isIdle(self));
     return result;
 }
 

@@ -2,6 +2,7 @@
 // have changed, and carry changes forward until they stop.
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
 #include <algorithm>
@@ -32,15 +33,14 @@ Py_ssize_t startOfUnprocessedWhitespace(PyObject* self, Py_ssize_t i) {
     const FinderState& s = finderState(self);
     Py_ssize_t b = i;
     while (b - 1 > s.lastProcessedIndex && b - 1 >= 0) {
-        py::Ref prior = logicalAt(self, b - 1);
-        if (!isWhitespace(requireLogical(prior.get()))) break;
+        if (!isWhitespace(logicalAt(self, b - 1).record())) break;
         --b;
     }
     return b;
 }
 
 PyObject* requireIndexList(PyObject* indices, const char* method) {
-    if (indices == Py_None) raiseNoneAttribute(method);
+    if (indices == Py_None) msg::raiseNoneAttribute(method);
     return indices;
 }
 
@@ -49,15 +49,11 @@ PyObject* requireIndexList(PyObject* indices, const char* method) {
 void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices) {
     FinderState& s = finderState(self);
     s.lastProcessedIndex = -1;
-    if (addedList == Py_None) raise(PyExc_TypeError, msg::kNoneNotIterable);
+    if (addedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
     for (Py_ssize_t k = 0; k < PyList_GET_SIZE(addedList); ++k) {
-        py::Ref item = py::Ref::own(PyList_GET_ITEM(addedList, k));
-        requireLogical(item.get());
+        LogicalRef item = LogicalRef::own(PyList_GET_ITEM(addedList, k));
         const Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get());
-        if (assertionsOn()) {
-            py::Ref at = logicalAt(self, i);
-            assertThat(at.get() == item.get());
-        }
+        assertListItemIs(self, i, item.get());
         py::Ref value = py::check(PyInt_FromSsize_t(i));
         py::checkStatus(PyList_Append(requireIndexList(indices, "append"), value.get()));
     }
@@ -68,8 +64,7 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
     while (position < PyList_GET_SIZE(indices)) {
         const Py_ssize_t i = py::asIndex(PyList_GET_ITEM(indices, position));
         ++position;
-        py::Ref item = logicalAt(self, i);
-        Logical* logical = requireLogical(item.get());
+        LogicalRef item = logicalAt(self, i);
         if (resume != -1) {
             if (i < resume) continue;
             resume = -1;
@@ -82,10 +77,11 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
         // Comment and blank lines take their scope from the code line after
         // them, so the whole unprocessed run around i is placed together.
         const Py_ssize_t first = startOfUnprocessedWhitespace(self, i);
-        if (isWhitespace(logical) || first < i) {
+        const bool whitespace = isWhitespace(item.record());
+        if (whitespace || first < i) {
             bringScopesSeenUpTo(self, first);
             const Py_ssize_t r = route::ProcessDedentedComments(self, first);
-            if (isWhitespace(logical)) {
+            if (whitespace) {
                 assertThat(r > i);
                 s.lastProcessedIndex = r - 1;
                 resume = r;
@@ -116,7 +112,8 @@ void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t 
     py::Ref scope = route::FindScopeNameContainingLogical(self, i);
     assertThat(!scope.isNone());
     requireStrOrNone(scope.get());
-    Logical* logical = requireLogical(logicalObj);
+    LogicalRef held = LogicalRef::own(logicalObj);
+    Logical* logical = held.record();
     py::Ref previous = py::Ref::own(scopeName(logical));
     bool changed = false;
     if (previous.isNone() || !strEquals(previous.get(), scope.get())) {
@@ -161,11 +158,10 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedI
     assertThat(s.nextChangeIndex != -1);
     Py_ssize_t k = start;
     while (k < s.nextChangeIndex) {
-        py::Ref item = logicalAt(self, k);
-        Logical* logical = requireLogical(item.get());
-        py::Ref previous = py::Ref::own(scopeName(logical));
+        LogicalRef item = logicalAt(self, k);
+        py::Ref previous = py::Ref::own(scopeName(item.record()));
         if (previous.isNone()) break;
-        if (isWhitespace(logical)) {
+        if (isWhitespace(item.record())) {
             // Placed with the rest of its run; an unchanged comment says
             // nothing about the code after it, so the scan goes on.
             const Py_ssize_t r = route::ProcessDedentedComments(self, k);
@@ -179,17 +175,17 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedI
             return;
         }
         if (py::checkStatus(PyObject_RichCompareBool(scope.get(), previous.get(), Py_EQ))) {
-            if (logical->fIndent <= changedIndent) return;
+            if (item->fIndent <= changedIndent) return;
             ++k;
             continue;
         }
-        if (!PyString_CheckExact(scope.get())) raiseExpectedType("str", scope.get());
+        if (!PyString_CheckExact(scope.get())) msg::raiseExpectedType("str", scope.get());
         // Recorded before the update, while a class/def still carries its
         // old local name, so that its old full name is in the change sets.
         route::LogicalInScopeChanged(self, item.get(), previous.get());
         route::UpdateLogicalScopeName(self, item.get(), k, scope.get());
         route::LogicalInScopeChanged(self, item.get(), scope.get());
-        if (logical->fIndent < changedIndent) changedIndent = logical->fIndent;
+        if (item->fIndent < changedIndent) changedIndent = item->fIndent;
         ++k;
     }
     // Cut short by the next index to visit (or by a logical not named yet):

@@ -3,7 +3,7 @@
 // growing prefix of the list and repairs the ones an edit has shifted.
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/names.hpp"
-#include "pysource/scopebodycache/report.hpp"
+#include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
 #include <cstring>
@@ -22,7 +22,7 @@ py::Ref bareName(PyObject* name) {
 
 PyObject* requireTable(PyObject* self) {
     PyObject* table = finderState(self).scopesSeen;
-    if (table == Py_None) raise(PyExc_TypeError, "argument of type 'NoneType' is not iterable");
+    if (table == Py_None) msg::raise(PyExc_TypeError, msg::kNoneArgumentNotIterable);
     return table;
 }
 
@@ -48,45 +48,34 @@ py::Ref replacePrefix(PyObject* name, PyObject* oldPrefix, PyObject* newPrefix) 
 namespace finder {
 
 Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logicalObj,
-                                                 PyObject* scopeName, bool nameIsBare) noexcept {
-    return neverRaises(
-        "pysource.scopebodycache.CChangeFinder._UpdateScopesSeenWithStartScopeLogical", Py_ssize_t(0),
-        [&]() -> Py_ssize_t {
-            Logical* logical = requireLogical(logicalObj);
-            py::Ref name = py::Ref::own(localScopeDefined(logical));
-            // A class/def line without a name defines nothing to count.
-            if (!name) return 0;
-            if (!nameIsBare) name = bareName(name.get());
-            py::Ref key = joinTwoScopeNames(scopeName, name.get());
-            PyObject* table = requireTable(self);
-            PyObject* seen = PyDict_GetItem(table, key.get());
-            const Py_ssize_t index = seen ? py::asIndex(seen) + 1 : 0;
-            py::Ref value = py::check(PyInt_FromSsize_t(index));
-            py::checkStatus(PyDict_SetItem(requireTable(self), key.get(), value.get()));
-            return index;
-        });
+                                                 PyObject* scopeName, bool nameIsBare) {
+    py::Ref name = py::Ref::own(localScopeDefined(requireLogical(logicalObj)));
+    // A class/def line without a name defines nothing to count.
+    if (!name) return 0;
+    if (!nameIsBare) name = bareName(name.get());
+    py::Ref key = joinTwoScopeNames(scopeName, name.get());
+    PyObject* table = requireTable(self);
+    PyObject* seen = PyDict_GetItem(table, key.get());
+    const Py_ssize_t index = seen ? py::asIndex(seen) + 1 : 0;
+    py::Ref value = py::check(PyInt_FromSsize_t(index));
+    py::checkStatus(PyDict_SetItem(requireTable(self), key.get(), value.get()));
+    return index;
 }
 
-Py_ssize_t FindScopeIndexForLogicalBody(PyObject* self, PyObject* logicalObj, Py_ssize_t i) {
+Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logicalObj, Py_ssize_t i) {
     FinderState& s = finderState(self);
     assertThat(i >= s.endIndexForScopesSeen);
     // The table may already reach i: the visiting loop brings it up to an
     // index before naming the logical there.
     if (i > s.endIndexForScopesSeen) UpdateScopesSeen(self, i);
     assertThat(i == s.endIndexForScopesSeen);
-    Logical* logical = requireLogical(logicalObj);
-    py::Ref keep = py::Ref::own(logicalObj);
-    py::Ref name = py::Ref::own(localScopeDefined(logical));
+    LogicalRef logical = LogicalRef::own(logicalObj);
+    py::Ref name = py::Ref::own(localScopeDefined(logical.record()));
     if (!name) return 0;
     if (leafScopeNameHasIndex(name.get())) name = bareName(name.get());
-    py::Ref key = joinTwoScopeNames(scopeName(logical), name.get());
+    py::Ref key = joinTwoScopeNames(scopeName(logical.record()), name.get());
     PyObject* seen = PyDict_GetItem(requireTable(self), key.get());
     return seen ? py::asIndex(seen) + 1 : 0;
-}
-
-Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logical, Py_ssize_t i) noexcept {
-    return neverRaises("pysource.scopebodycache.CChangeFinder._FindScopeIndexForLogical",
-                       Py_ssize_t(0), [&] { return FindScopeIndexForLogicalBody(self, logical, i); });
 }
 
 void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
@@ -100,22 +89,21 @@ void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
     }
     const Py_ssize_t begin = s.endIndexForScopesSeen;
     for (Py_ssize_t j = begin; j < end; ++j) {
-        py::Ref item = logicalAt(self, j);
-        Logical* logical = requireLogical(item.get());
-        if (!isScopeStart(logical)) continue;
-        py::Ref scope = py::Ref::own(scopeName(logical));
-        py::Ref local = py::Ref::own(localScopeDefined(logical));
+        LogicalRef item = logicalAt(self, j);
+        if (!isScopeStart(item.record())) continue;
+        py::Ref scope = py::Ref::own(scopeName(item.record()));
+        py::Ref local = py::Ref::own(localScopeDefined(item.record()));
         if (!local) continue;  // nothing to number
         py::Ref bare, oldIndex;
         if (leafScopeNameHasIndex(local.get())) {
             py::Ref split = splitScopeNameFromSuffixes(local.get());
-            unpackTwo(split.get(), &bare, &oldIndex);
+            unpackPair(split.get(), &bare, &oldIndex, true);
         } else {
             bare = local.copy();
             oldIndex = py::check(PyInt_FromLong(-1));
         }
         const Py_ssize_t counted =
-            UpdateScopesSeenWithStartScopeLogical(self, item.get(), scope.get(), false);
+            route::UpdateScopesSeenWithStartScopeLogical(self, item.get(), scope.get(), false);
         py::Ref newIndex = py::check(PyInt_FromSsize_t(counted));
         if (py::checkStatus(PyObject_RichCompareBool(newIndex.get(), oldIndex.get(), Py_EQ))) continue;
 
@@ -127,7 +115,7 @@ void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
         assertThat(hadIndex);
         if (!hadIndex) continue;
         py::Ref oldFull = joinTwoScopeNames(scope.get(), local.get());
-        addChange(logical->fKind == kClassLogical ? s.classChanges : s.functionChanges, oldFull.get());
+        addChange(item->fKind == kClassLogical ? s.classChanges : s.functionChanges, oldFull.get());
         py::Ref newFull = joinTwoScopeNames(scope.get(), newLocal.get());
         // The renamed body may reach past `end`: rename all of it now, or
         // the lines beyond keep the old index (nothing walks this
@@ -141,23 +129,22 @@ void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
 void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName, PyObject* newScopeName,
                                       Py_ssize_t start, Py_ssize_t end) {
     for (Py_ssize_t j = start; j < end; ++j) {
-        py::Ref item = logicalAt(self, j);
-        Logical* logical = requireLogical(item.get());
-        py::Ref name = py::Ref::own(scopeName(logical));
+        LogicalRef item = logicalAt(self, j);
+        py::Ref name = py::Ref::own(scopeName(item.record()));
         // A logical added in this call and not yet visited has no name; it
         // is named when visited.
         if (name.isNone()) continue;
         if (!startsWith(name.get(), oldScopeName)) {
             // Comments after the body may sit in the parent scope while
             // deeper ones after them are still in the body.
-            if (isWhitespace(logical)) continue;
+            if (isWhitespace(item.record())) continue;
             break;
         }
         py::Ref renamed = replacePrefix(name.get(), oldScopeName, newScopeName);
         requireStrOrNone(renamed.get());
-        setScopeName(logical, renamed.get());
+        setScopeName(item.record(), renamed.get());
         // Old names too: the scopes nested here had other full names before.
-        PyObject* leaf = isScopeStart(logical) ? localScopeDefined(logical) : nullptr;
+        PyObject* leaf = isScopeStart(item.record()) ? localScopeDefined(item.record()) : nullptr;
         py::Ref oldLeaf = py::Ref::own(leaf ? leaf : Py_None);
         route::LogicalInScopeChanged(self, item.get(), renamed.get(), name.get(), oldLeaf.get());
     }

@@ -2,6 +2,7 @@
 // when a file was just read or its contents were replaced.
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/names.hpp"
+#include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
 #include <vector>
@@ -24,10 +25,9 @@ void FindChangesEntireListAdded(PyObject* self) {
     stack.push_back({py::Ref::own(gNames.empty), -1});
     Py_ssize_t i = 0;
     while (i < logicalListLength(self)) {
-        py::Ref item = logicalAt(self, i);
-        Logical* logical = requireLogical(item.get());
+        LogicalRef logical = logicalAt(self, i);
         const int indent = logical->fIndent;
-        if (isWhitespace(logical) && indent <= stack.back().indent) {
+        if (isWhitespace(logical.record()) && indent <= stack.back().indent) {
             const Py_ssize_t next = route::ProcessDedentedComments(self, i);
             // The step reports its own failures and answers 0; restarting
             // the walk there could loop for ever.
@@ -38,19 +38,20 @@ void FindChangesEntireListAdded(PyObject* self) {
         while (indent <= stack.back().indent) {
             assertThat(stack.size() >= 2);
             stack.pop_back();
-            if (stack.empty()) raise(PyExc_IndexError, "list index out of range");
+            if (stack.empty()) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
         }
         PyObject* topName = stack.back().name.get();
         py::Ref local = py::Ref::none();
-        const bool scopeStart = isScopeStart(logical);
+        const bool scopeStart = isScopeStart(logical.record());
         if (scopeStart) {
             // Counted by bare name: a list read before carries indexed
             // names, which must not count as names of their own.
-            const Py_ssize_t index = UpdateScopesSeenWithStartScopeLogical(self, item.get(), topName, false);
-            local = route::GetLeafScopeWithIndex(self, item.get(), index);
+            const Py_ssize_t index =
+                route::UpdateScopesSeenWithStartScopeLogical(self, logical.get(), topName, false);
+            local = route::GetLeafScopeWithIndex(self, logical.get(), index);
         }
         py::Ref top = stack.back().name.copy();
-        route::SetLogicalScopeNames(self, item.get(), i, top.get(), local.get());
+        route::SetLogicalScopeNames(self, logical.get(), i, top.get(), local.get());
         if (scopeStart && !local.isNone()) {
             py::Ref full = joinTwoScopeNames(top.get(), local.get());
             addChange(logical->fKind == kClassLogical ? s.classChanges : s.functionChanges, full.get());

@@ -1,10 +1,9 @@
 #include "pysource/scopebodycache/fullname.hpp"
 
 #include "pysource/contracts/accessors.hpp"
-#include "pysource/scopebodycache/finder.hpp"
+#include "pysource/scopebodycache/finder.hpp"  // assertThat
 #include "pysource/scopebodycache/function.hpp"
 #include "pysource/scopebodycache/names.hpp"
-#include "pysource/scopebodycache/pickling.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
 namespace sbc {
@@ -48,10 +47,9 @@ py::Ref callGetFullNameForScopeDef(PyObject* scopeDef) {
 }
 
 void bindModuleFunctions(PyObject* moduleDict) {
-    py::Ref f = newFunction(kFullNameSpec, "pysource.scopebodycache");
+    py::Ref f = newFunction(kFullNameSpec, kModuleName);
     py::checkStatus(PyDict_SetItemString(moduleDict, kFullNameSpec.name, f.get()));
     gFullNameFunction = f.release();
-    bindUnpickleFunctions(moduleDict);
 }
 
 }  // namespace sbc

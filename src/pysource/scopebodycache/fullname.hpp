@@ -11,7 +11,7 @@ py::Ref getFullNameForScopeDef(PyObject* scopeDef);
 // Calls whatever the module global GetFullNameForScopeDef holds now.
 py::Ref callGetFullNameForScopeDef(PyObject* scopeDef);
 
-// Binds the module functions of this subsystem in the module namespace.
+// Binds GetFullNameForScopeDef in the module namespace.
 void bindModuleFunctions(PyObject* moduleDict);
 
 }  // namespace sbc

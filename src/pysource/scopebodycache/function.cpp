@@ -255,6 +255,21 @@ py::Ref newMethod(const FunctionSpec& spec, PyTypeObject* owner, const char* mod
     return makeFunction(spec, PyString_AS_STRING(qual.get()), module, owner);
 }
 
+void bindMethods(PyTypeObject* type, const FunctionSpec* specs, size_t count, const char* module) {
+    for (size_t k = 0; k < count; ++k) {
+        py::Ref f = newMethod(specs[k], type, module);
+        py::checkStatus(PyDict_SetItemString(type->tp_dict, specs[k].name, f.get()));
+    }
+    PyType_Modified(type);
+}
+
+void bindFunctions(PyObject* moduleDict, const FunctionSpec* specs, size_t count, const char* module) {
+    for (size_t k = 0; k < count; ++k) {
+        py::Ref f = newFunction(specs[k], module);
+        py::checkStatus(PyDict_SetItemString(moduleDict, specs[k].name, f.get()));
+    }
+}
+
 bool isBoundFormOf(PyObject* callable, PyObject* function) {
     return PyMethod_Check(callable) && PyMethod_GET_FUNCTION(callable) == function;
 }

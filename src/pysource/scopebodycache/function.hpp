@@ -53,6 +53,23 @@ py::Ref newFunction(const FunctionSpec& spec, const char* module);
 // "<owner>.<name>", __module__ the owner's module.
 py::Ref newMethod(const FunctionSpec& spec, PyTypeObject* owner, const char* module);
 
+// Puts a method for each spec into the class dictionary of `type`, in
+// order, reporting `module` as their __module__.
+void bindMethods(PyTypeObject* type, const FunctionSpec* specs, size_t count, const char* module);
+
+template <size_t N>
+void bindMethods(PyTypeObject* type, const FunctionSpec (&specs)[N], const char* module) {
+    bindMethods(type, specs, N, module);
+}
+
+// Binds a module-level function for each spec in `moduleDict`, in order.
+void bindFunctions(PyObject* moduleDict, const FunctionSpec* specs, size_t count, const char* module);
+
+template <size_t N>
+void bindFunctions(PyObject* moduleDict, const FunctionSpec (&specs)[N], const char* module) {
+    bindFunctions(moduleDict, specs, N, module);
+}
+
 // Whether `callable` is the bound form of `function` (our own built-in
 // method as found on an instance).
 bool isBoundFormOf(PyObject* callable, PyObject* function);

@@ -1,6 +1,8 @@
 // The module's init function: binds the siblings' entry points, makes the
 // two classes ready and fills the namespace, in a fixed order.
+#include "common/messages.hpp"
 #include "pysource/scopebodycache/bodycache.hpp"
+#include "pysource/scopebodycache/dispatch.hpp"
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/fullname.hpp"
 #include "pysource/scopebodycache/function.hpp"
@@ -14,7 +16,6 @@
 namespace sbc {
 namespace {
 
-constexpr const char kModuleName[] = "pysource.scopebodycache";
 constexpr const char kInitContext[] = "init pysource.scopebodycache";
 
 const char kModuleDoc[] =
@@ -40,7 +41,7 @@ void checkBuiltinNames() {
     PyObject* builtins = PyEval_GetBuiltins();
     for (const char* name : {"KeyError", "ValueError", "IndexError", "range", "enumerate", "TypeError"}) {
         if (builtins == nullptr || PyDict_GetItemString(builtins, name) == nullptr) {
-            PyErr_Format(PyExc_NameError, "name '%.200s' is not defined", name);
+            PyErr_Format(PyExc_NameError, msg::kNameNotDefined, name);
             py::fail();
         }
     }
@@ -55,7 +56,7 @@ void moduleBody(PyObject* dict) {
                                                               nullptr, 0));
     py::checkStatus(PyDict_SetItemString(dict, "tallowkit", tallowkit.get()));
 
-    py::Ref fastaccess = py::check(PyImport_ImportModule("pysource._fastaccess"));
+    py::Ref fastaccess = py::check(PyImport_ImportModule(kFastaccessModule));
     py::checkStatus(PyDict_SetItemString(dict, "_fastaccess", fastaccess.get()));
 
     py::Ref fromlist = py::check(Py_BuildValue("(s)", "symbolinfo"));
@@ -74,6 +75,7 @@ void moduleBody(PyObject* dict) {
     bindScopeBodyCacheMethods();
     bindChangeFinderMethods();
     bindModuleFunctions(dict);
+    bindUnpickleFunctions(dict);
     bindUtilities(dict);
 }
 
@@ -87,6 +89,7 @@ void initialize() {
     py::checkStatus(PyDict_SetItemString(dict, "__builtins__", builtinModule.get()));
 
     internNames();
+    internStepNames();
     readyFunctionType();
     checkBuiltinNames();
 
@@ -126,11 +129,8 @@ void addInitTraceback() {
 PY_MODULE_INIT initscopebodycache() {
     try {
         sbc::initialize();
-        return;
-    } catch (const py::Error&) {
-    } catch (const std::bad_alloc&) {
-        PyErr_NoMemory();
+    } catch (...) {
+        py::setErrorFromCurrentException();
+        sbc::addInitTraceback();
     }
-    if (!PyErr_Occurred()) PyErr_SetString(PyExc_ImportError, sbc::kInitContext);
-    sbc::addInitTraceback();
 }

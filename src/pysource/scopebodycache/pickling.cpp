@@ -15,28 +15,32 @@
 #include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
+#include <cstddef>
+#include <string_view>
+
 namespace sbc {
 namespace {
 
-constexpr const char kModule[] = "pysource.scopebodycache";
 
 enum class FieldKind : uint8_t {
     Destroyed,  // the base's flag, stored as True/False
-    Object,     // an object slot; None or the type its store checks
-    Index,      // a Py_ssize_t, stored as an int
+    Signals,    // the base's __fSignalCatchers: dict or None
+    Object,     // an object slot of the state block: None or exactly `type`
+    Index,      // a Py_ssize_t of the state block, stored as an int
 };
 
 struct Field {
     FieldKind kind;
-    PyObject* (*read)(PyObject* self);                 // Object: borrowed, never null
-    void (*store)(PyObject* self, PyObject* value);    // Object: checks the type
-    Py_ssize_t* (*index)(PyObject* self);              // Index
+    Py_ssize_t offset;   // within the state block (Object, Index)
+    PyTypeObject* type;  // Object: the exact type accepted besides None
+    const char* typeName;
 };
 
 constexpr int kMaxFields = 10;
 
 struct PickledClass {
     PyTypeObject* (*type)() noexcept;
+    const Py_ssize_t* stateOffset;  // where the state block starts
     long checksum;
     const char* checksumMessage;  // one %zd: the checksum found in the pickle
     PyObject* Names::*rebuildName;
@@ -48,71 +52,54 @@ contracts::DestroyableObject* base(PyObject* self) noexcept {
     return reinterpret_cast<contracts::DestroyableObject*>(self);
 }
 
-PyObject* orNone(PyObject* o) noexcept { return o != nullptr ? o : Py_None; }
+// --- The field tables, expanded from the classes' field lists --------------
+// The two base fields come first: their names sort before ours.
 
-// --- The field tables, in the order of the state tuple ----------------------
+#define SBC_BASE_FIELD_NAMES "__fDestroyed, __fSignalCatchers"
+#define SBC_BASE_FIELDS {FieldKind::Destroyed, 0, nullptr, nullptr}, {FieldKind::Signals, 0, nullptr, "dict"},
+#define SBC_PICKLED_FIELD(State, kind, member, type) \
+    {FieldKind::kind, static_cast<Py_ssize_t>(offsetof(State, member)), SBC_FIELD_TYPE_##type, #type},
+#define SBC_FINDER_FIELD(kind, member, name, type) SBC_PICKLED_FIELD(FinderState, kind, member, type)
+#define SBC_BODY_CACHE_FIELD(kind, member, name, type) SBC_PICKLED_FIELD(BodyCacheState, kind, member, type)
 
-const Field kDestroyed = {FieldKind::Destroyed, nullptr, nullptr, nullptr};
-
-const Field kSignalCatchers = {
-    FieldKind::Object, [](PyObject* self) { return orNone(base(self)->fSignalCatchers); },
-    [](PyObject* self, PyObject* value) {
-        if (value != Py_None && !PyDict_CheckExact(value)) raiseExpectedType("dict", value);
-        py::storeSlot(&base(self)->fSignalCatchers, value);
-    },
-    nullptr};
+// Stored pickles carry these checksums for exactly these field lists; the
+// hashes below fail the build if a list changes without a new checksum and
+// a way to load the pickles made before.
+constexpr std::string_view kFinderFieldList = SBC_BASE_FIELD_NAMES SBC_FINDER_FIELDS(SBC_FIELD_NAME_LIST);
+static_assert(namesSorted(kFinderFieldList), "the state tuple is sorted by field name");
+static_assert(fieldListHash(kFinderFieldList) == 0x541e59a9u, "CChangeFinder pickles carry 0x093a2af");
+constexpr std::string_view kBodyCacheFieldList =
+    SBC_BASE_FIELD_NAMES SBC_BODY_CACHE_FIELDS(SBC_FIELD_NAME_LIST);
+static_assert(namesSorted(kBodyCacheFieldList), "the state tuple is sorted by field name");
+static_assert(fieldListHash(kBodyCacheFieldList) == 0xfcb07ba2u, "CScopeBodyCache pickles carry 0xa66c71f");
 
 const PickledClass kChangeFinder = {
     changeFinderType,
+    &gFinderStateOffset,
     0x093a2af,
-    "Incompatible checksums (%zd vs 0x093a2af = (__fDestroyed, __fSignalCatchers, "
-    "_fCurrentClassChanges, _fCurrentContentsChanges, _fCurrentFunctionChanges, "
-    "_fEndIndexForScopesSeen, _fLastProcessedIndex, _fLogicalList, _fNextChangeIndex, "
-    "_fScopesSeen))",
+    "Incompatible checksums (%zd vs 0x093a2af = (" SBC_BASE_FIELD_NAMES SBC_FINDER_FIELDS(SBC_FIELD_NAME_LIST) "))",
     &Names::unpickleChangeFinder,
-    10,
-    {
-        kDestroyed,
-        kSignalCatchers,
-        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).classChanges); },
-         [](PyObject* self, PyObject* v) { setChangeSet(&finderState(self).classChanges, v); }, nullptr},
-        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).contentsChanges); },
-         [](PyObject* self, PyObject* v) { setChangeSet(&finderState(self).contentsChanges, v); }, nullptr},
-        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).functionChanges); },
-         [](PyObject* self, PyObject* v) { setChangeSet(&finderState(self).functionChanges, v); }, nullptr},
-        {FieldKind::Index, nullptr, nullptr,
-         [](PyObject* self) { return &finderState(self).endIndexForScopesSeen; }},
-        {FieldKind::Index, nullptr, nullptr,
-         [](PyObject* self) { return &finderState(self).lastProcessedIndex; }},
-        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).logicalList); },
-         setLogicalList, nullptr},
-        {FieldKind::Index, nullptr, nullptr,
-         [](PyObject* self) { return &finderState(self).nextChangeIndex; }},
-        {FieldKind::Object, [](PyObject* self) { return orNone(finderState(self).scopesSeen); },
-         setScopesSeen, nullptr},
-    },
+    2 + 0 SBC_FINDER_FIELDS(SBC_COUNT_FIELD),
+    {SBC_BASE_FIELDS SBC_FINDER_FIELDS(SBC_FINDER_FIELD)},
 };
 
 const PickledClass kScopeBodyCache = {
     scopeBodyCacheType,
+    &gBodyCacheStateOffset,
     0xa66c71f,
-    "Incompatible checksums (%zd vs 0xa66c71f = (__fDestroyed, __fSignalCatchers, _fLogicalList, "
-    "_fScopeBodyCache, _fScopeDefCache))",
+    "Incompatible checksums (%zd vs 0xa66c71f = (" SBC_BASE_FIELD_NAMES SBC_BODY_CACHE_FIELDS(SBC_FIELD_NAME_LIST) "))",
     &Names::unpickleScopeBodyCache,
-    5,
-    {
-        kDestroyed,
-        kSignalCatchers,
-        {FieldKind::Object, [](PyObject* self) { return orNone(bodyCacheState(self).logicalList); },
-         setBodyCacheLogicalList, nullptr},
-        {FieldKind::Object, [](PyObject* self) { return orNone(bodyCacheState(self).scopeBodyCache); },
-         [](PyObject* self, PyObject* v) { setBodyCacheDict(&bodyCacheState(self).scopeBodyCache, v); },
-         nullptr},
-        {FieldKind::Object, [](PyObject* self) { return orNone(bodyCacheState(self).scopeDefCache); },
-         [](PyObject* self, PyObject* v) { setBodyCacheDict(&bodyCacheState(self).scopeDefCache, v); },
-         nullptr},
-    },
+    2 + 0 SBC_BODY_CACHE_FIELDS(SBC_COUNT_FIELD),
+    {SBC_BASE_FIELDS SBC_BODY_CACHE_FIELDS(SBC_BODY_CACHE_FIELD)},
 };
+
+PyObject*& objectAt(const PickledClass& c, const Field& f, PyObject* self) {
+    return *reinterpret_cast<PyObject**>(reinterpret_cast<char*>(self) + *c.stateOffset + f.offset);
+}
+
+Py_ssize_t& indexAt(const PickledClass& c, const Field& f, PyObject* self) {
+    return *reinterpret_cast<Py_ssize_t*>(reinterpret_cast<char*>(self) + *c.stateOffset + f.offset);
+}
 
 // --- Reduce -------------------------------------------------------------------
 
@@ -134,12 +121,15 @@ py::Ref reduce(const PickledClass& c, PyObject* self) {
         case FieldKind::Destroyed:
             fields[i] = py::Ref::own(base(self)->fDestroyed ? Py_True : Py_False);
             break;
-        case FieldKind::Object:
-            fields[i] = py::Ref::own(f.read(self));
+        case FieldKind::Signals:
+        case FieldKind::Object: {
+            PyObject* value = f.kind == FieldKind::Signals ? base(self)->fSignalCatchers : objectAt(c, f, self);
+            fields[i] = py::Ref::own(value != nullptr ? value : Py_None);
             anyObjectSet = anyObjectSet || !fields[i].isNone();
             break;
+        }
         case FieldKind::Index:
-            fields[i] = py::check(PyInt_FromSsize_t(*f.index(self)));
+            fields[i] = py::check(PyInt_FromSsize_t(indexAt(c, f, self)));
             break;
         }
     }
@@ -166,17 +156,18 @@ py::Ref reduce(const PickledClass& c, PyObject* self) {
 // Fields are assigned one at a time as they are read: a failure part way
 // leaves the earlier ones assigned.
 void applyState(const PickledClass& c, PyObject* self, PyObject* state) {
-    if (state == Py_None) raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
+    if (state == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
     py::Ref keep = py::Ref::own(state);
     const Py_ssize_t size = PyTuple_GET_SIZE(state);
     for (int i = 0; i < c.fieldCount; ++i) {
-        if (i >= size) raise(PyExc_IndexError, "tuple index out of range");
+        if (i >= size) msg::raise(PyExc_IndexError, msg::kTupleIndexOutOfRange);
         PyObject* item = PyTuple_GET_ITEM(state, i);
         const Field& f = c.fields[i];
         switch (f.kind) {
         case FieldKind::Destroyed: base(self)->fDestroyed = py::truth(item) ? 1 : 0; break;
-        case FieldKind::Object: f.store(self, item); break;
-        case FieldKind::Index: *f.index(self) = py::asIndex(item); break;
+        case FieldKind::Signals: storeTyped(&base(self)->fSignalCatchers, item, &PyDict_Type, "dict"); break;
+        case FieldKind::Object: storeTyped(&objectAt(c, f, self), item, f.type, f.typeName); break;
+        case FieldKind::Index: indexAt(c, f, self) = py::asIndex(item); break;
         }
     }
     if (size > c.fieldCount && PyObject_HasAttr(self, gNames.dict)) {
@@ -187,7 +178,7 @@ void applyState(const PickledClass& c, PyObject* self, PyObject* state) {
 }
 
 void setState(const PickledClass& c, PyObject* self, PyObject* state) {
-    if (state != Py_None && !PyTuple_CheckExact(state)) raiseExpectedType("tuple", state);
+    if (state != Py_None && !PyTuple_CheckExact(state)) msg::raiseExpectedType("tuple", state);
     applyState(c, self, state);
 }
 
@@ -206,7 +197,7 @@ py::Ref rebuild(const PickledClass& c, PyObject* type, PyObject* checksumArg, Py
                                                    const_cast<char*>("__new__"), const_cast<char*>("(O)"),
                                                    type));
     if (state != Py_None) {
-        if (!PyTuple_CheckExact(state)) raiseExpectedType("tuple", state);
+        if (!PyTuple_CheckExact(state)) msg::raiseExpectedType("tuple", state);
         applyState(c, result.get(), state);
     }
     return result;
@@ -237,6 +228,9 @@ struct ClassFunctions {
     FunctionSpec unpickle;
 };
 
+// The rebuild functions' names and parameter names are written into every
+// pickle (pickle refers to a function by module and name, and callers may
+// pass the arguments by keyword): they never change.
 constexpr Param kStateParam{"__pyx_state", ArgCheck::Any};
 #define SBC_UNPICKLE_PARAMS \
     {{"__pyx_type", ArgCheck::Any}, {"__pyx_checksum", ArgCheck::Any}, kStateParam}
@@ -273,9 +267,9 @@ void install(PyTypeObject* type) {
     if (PyObject_HasAttrString(typeObject, "__getstate__")) return;
     if (!inheritsFromObject(type, "__reduce_ex__") || !inheritsFromObject(type, "__reduce__")) return;
     const ClassFunctions& f = functionsFor(type);
-    py::Ref reduceMethod = newMethod(f.reduce, type, kModule);
+    py::Ref reduceMethod = newMethod(f.reduce, type, kModuleName);
     py::checkStatus(PyDict_SetItemString(type->tp_dict, "__reduce__", reduceMethod.get()));
-    py::Ref setstateMethod = newMethod(f.setstate, type, kModule);
+    py::Ref setstateMethod = newMethod(f.setstate, type, kModuleName);
     py::checkStatus(PyDict_SetItemString(type->tp_dict, "__setstate__", setstateMethod.get()));
     PyType_Modified(type);
 }
@@ -286,8 +280,8 @@ void installPickling(PyTypeObject* type) {
     try {
         install(type);
         return;
-    } catch (const py::Error&) {
-    } catch (const std::bad_alloc&) {
+    } catch (...) {
+        py::setErrorFromCurrentException();
     }
     PyErr_Clear();
     PyErr_Format(PyExc_RuntimeError, "Unable to initialize pickling for %s", type->tp_name);
@@ -296,7 +290,7 @@ void installPickling(PyTypeObject* type) {
 
 void bindUnpickleFunctions(PyObject* moduleDict) {
     for (const ClassFunctions* f : {&kScopeBodyCacheFunctions, &kChangeFinderFunctions}) {
-        py::Ref function = newFunction(f->unpickle, kModule);
+        py::Ref function = newFunction(f->unpickle, kModuleName);
         py::checkStatus(PyDict_SetItemString(moduleDict, f->unpickle.name, function.get()));
     }
 }

@@ -15,9 +15,8 @@ template <class T, class Body>
 T neverRaises(const char* context, T fallback, Body&& body) noexcept {
     try {
         return body();
-    } catch (const py::Error&) {
-    } catch (const std::bad_alloc&) {
-        PyErr_NoMemory();
+    } catch (...) {
+        py::setErrorFromCurrentException();
     }
     reportUnraisable(context);
     return fallback;

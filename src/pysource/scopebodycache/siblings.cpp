@@ -1,5 +1,6 @@
 #include "pysource/scopebodycache/siblings.hpp"
 
+#include "common/messages.hpp"
 #include "pysource/contracts/accessors.hpp"
 #include "pysource/contracts/sibling_types.hpp"
 #include "pysource/scopebodycache/names.hpp"
@@ -15,21 +16,15 @@ PyObject* gModuleDict = nullptr;
 
 namespace {
 
-constexpr const char* kFastaccess = "pysource._fastaccess";
-constexpr const char* kSymbolinfo = "pysource.symbolinfo";
-constexpr const char* kDestroyable = "tallowkit.destroyable";
-
-// The imported module, not its top-level package.
-py::Ref importSubmodule(const char* name) {
-    py::Ref top = py::check(PyImport_ImportModule(name));
-    return top;
-}
+constexpr const char* kFastaccess = kFastaccessModule;
+constexpr const char* kSymbolinfo = kSymbolinfoModule;
+constexpr const char* kDestroyable = kDestroyableModule;
 
 // A type attribute of `module`, checked against the size this module was
 // built for; with `vtable`, its native method table must be present too.
 py::Ref importType(const char* moduleName, const char* typeName, Py_ssize_t expectedSize,
                    bool vtable) {
-    py::Ref module = importSubmodule(moduleName);
+    py::Ref module = py::check(PyImport_ImportModule(moduleName));
     py::Ref obj = py::check(PyObject_GetAttrString(module.get(), typeName));
     if (!PyType_Check(obj.get())) {
         PyErr_Format(PyExc_TypeError, "%.200s.%.200s is not a type object", moduleName, typeName);
@@ -68,7 +63,7 @@ py::Ref importType(const char* moduleName, const char* typeName, Py_ssize_t expe
 // The capsule of entry `name` in the module's table; `what` is "variable" or
 // "function" for the messages.
 void* entryPoint(const char* moduleName, const char* name, const char* signature, bool isFunction) {
-    py::Ref module = importSubmodule(moduleName);
+    py::Ref module = py::check(PyImport_ImportModule(moduleName));
     py::Ref table = py::check(PyObject_GetAttrString(module.get(), contracts::kCapiAttr));
     PyObject* capsule = PyDict_Check(table.get()) ? PyDict_GetItemString(table.get(), name) : nullptr;
     if (capsule == nullptr) {
@@ -178,7 +173,7 @@ PyObject* lookupGlobal(PyObject* name) {
     PyObject* v = PyDict_GetItem(gModuleDict, name);
     if (v == nullptr) v = PyDict_GetItem(PyEval_GetBuiltins(), name);
     if (v == nullptr) {
-        PyErr_Format(PyExc_NameError, "name '%.200s' is not defined", PyString_AS_STRING(name));
+        PyErr_Format(PyExc_NameError, msg::kNameNotDefined, PyString_AS_STRING(name));
         py::fail();
     }
     return v;

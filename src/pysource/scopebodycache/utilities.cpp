@@ -26,7 +26,7 @@ double getNowTime() noexcept {
 
 char getInfoBytesKind(PyObject* ibytes) noexcept {
     return neverRaises("pysource.symbolinfo.GetInfoBytesKind", char(0), [ibytes] {
-        if (ibytes == Py_None) raise(PyExc_TypeError, msg::kNoneHasNoLen);
+        if (ibytes == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
         if (PyString_GET_SIZE(ibytes) < 2 || PyString_AS_STRING(ibytes)[0] != ':') {
             return gSymbolInfo.kPlainEquivKind;
         }
@@ -88,10 +88,10 @@ PyObject* py_SetLogicalLocalScopeDefined(PyObject*, PyObject* const* a) {
 
 PyObject* py_PySet_InplaceOr(PyObject*, PyObject* const* a) {
     PyObject* set = a[0];
-    if (set == Py_None) raise(PyExc_TypeError, msg::kNoneHasNoLen);
+    if (set == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
     const Py_ssize_t before = py::checkSize(PySet_Size(set));
     py::Ref result = py::check(PyNumber_InPlaceOr(set, a[1]));
-    if (Py_TYPE(result.get()) != &PySet_Type) raiseExpectedType("set", result.get());
+    if (Py_TYPE(result.get()) != &PySet_Type) msg::raiseExpectedType("set", result.get());
     return boolResult(PySet_GET_SIZE(result.get()) != before);
 }
 
@@ -113,11 +113,11 @@ PyObject* py_DoubleValueForULongLongBits(PyObject*, PyObject* const* a) {
     unsigned long long bits;
     if (PyInt_Check(o)) {
         const long v = PyInt_AS_LONG(o);
-        if (v < 0) raise(PyExc_OverflowError, "can't convert negative value to unsigned long long");
+        if (v < 0) msg::raise(PyExc_OverflowError, msg::kNegativeToUnsigned);
         bits = static_cast<unsigned long long>(v);
     } else if (PyLong_Check(o)) {
         if (_PyLong_Sign(o) < 0) {
-            raise(PyExc_OverflowError, "can't convert negative value to unsigned long long");
+            msg::raise(PyExc_OverflowError, msg::kNegativeToUnsigned);
         }
         bits = PyLong_AsUnsignedLongLong(o);
         if (bits == static_cast<unsigned long long>(-1) && PyErr_Occurred()) py::fail();
@@ -138,7 +138,7 @@ PyObject* py_DoubleValueForPyIntBits(PyObject*, PyObject* const* a) {
 PyObject* py_IsDefKind(PyObject*, PyObject* const* a) {
     const long v = PyInt_AsLong(a[0]);
     if (v == -1 && PyErr_Occurred()) py::fail();
-    if (v < -128 || v > 127) raise(PyExc_OverflowError, "value too large to convert to char");
+    if (v < -128 || v > 127) msg::raise(PyExc_OverflowError, "value too large to convert to char");
     return boolResult(isDefKind(static_cast<char>(v)));
 }
 
@@ -181,14 +181,8 @@ const FunctionSpec kSymbolinfoFunctions[] = {
 }  // namespace
 
 void bindUtilities(PyObject* moduleDict) {
-    for (const auto& spec : kFastaccessFunctions) {
-        py::Ref f = newFunction(spec, "pysource._fastaccess");
-        py::checkStatus(PyDict_SetItemString(moduleDict, spec.name, f.get()));
-    }
-    for (const auto& spec : kSymbolinfoFunctions) {
-        py::Ref f = newFunction(spec, "pysource.symbolinfo");
-        py::checkStatus(PyDict_SetItemString(moduleDict, spec.name, f.get()));
-    }
+    bindFunctions(moduleDict, kFastaccessFunctions, kFastaccessModule);
+    bindFunctions(moduleDict, kSymbolinfoFunctions, kSymbolinfoModule);
 }
 
 }  // namespace sbc
