@@ -177,8 +177,9 @@ class DriverTest(unittest.TestCase):
                 (('nested',), (ValueError, kRecursive), done, False),
                 (('caught',), None, ['prepare', 'removed', kRecursive, 'whole', 'clear'], False),
                 (('prepare',), 'prepare', ['prepare'], False),
-                # Prepared, then failed: nothing clears, so the finder stays busy.
-                (('prepared',), 'prepared', ['prepare'], True)]:
+                # Prepared, then failed: _Clear is not called, yet the
+                # finder is not left marked as in a call.
+                (('prepared',), 'prepared', ['prepare'], False)]:
             lst = Read(kSampleSource)
             finder = Recorder(lst)
             finder.fail, finder.calls = fail, []

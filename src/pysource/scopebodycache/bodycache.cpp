@@ -208,7 +208,7 @@ using Slots = DestroyableSubclass<BodyCacheState, &gBodyCacheStateOffset>;
 
 int cache_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
-        storeTyped(&bodyCacheState(self).logicalList, initDestroyableSubclass(self, args, kwargs),
+        storeTyped(&bodyCacheState(self).logicalList, initDestroyableSubclass(self, args, kwargs).get(),
                    &PyList_Type, "list");
         BodyCacheState& s = bodyCacheState(self);
         py::Ref bodies = py::check(PyDict_New());

@@ -89,15 +89,17 @@ private:
 
 // The first steps of both __init__s: parse the one argument `logical_list`,
 // then run CDestroyable.__init__(self), looked up as Python code would.
-// Returns the argument (borrowed from the call).
-inline PyObject* initDestroyableSubclass(PyObject* self, PyObject* args, PyObject* kwargs) {
+// Returns the argument, held: the base's __init__ may run Python code that
+// clears the caller's keyword dict.
+inline py::Ref initDestroyableSubclass(PyObject* self, PyObject* args, PyObject* kwargs) {
     static const FunctionSpec spec = {"__init__", nullptr, nullptr, 1, 1,
                                       {{"logical_list", ArgCheck::Any}}, true};
-    PyObject* argv[kMaxParams];
-    parseArgs(spec, args, kwargs, argv);
+    ParsedArgs parsed;
+    parseArgs(spec, args, 0, kwargs, parsed);
+    py::Ref logicalList = py::Ref::own(parsed[0]);
     py::check(PyObject_CallMethod(reinterpret_cast<PyObject*>(gDestroyableType),
                                   const_cast<char*>("__init__"), const_cast<char*>("(O)"), self));
-    return argv[0];
+    return logicalList;
 }
 
 }  // namespace sbc

@@ -120,6 +120,11 @@ contracts::LogicalRef logicalAt(PyObject* self, Py_ssize_t i);
 // are on, like the statement it stands for.
 void assertListItemIs(PyObject* self, Py_ssize_t i, PyObject* logical);
 void addChange(PyObject* set, PyObject* name);
+// The comment step answered `end` for a run at `at`: an answer that does not
+// advance means it could not place the run (it reported why). That is an
+// AssertionError where the steps assert; optimised, going on would loop or
+// return with the run unnamed, so it is a RuntimeError.
+void requireRunPlaced(Py_ssize_t end, Py_ssize_t at);
 // A scope name about to be stored or used: str or None, else TypeError.
 void requireStrOrNone(PyObject* name);
 // `a, b = seq` (exactly two items) or, with firstTwo, `a, b = seq[:2]`.

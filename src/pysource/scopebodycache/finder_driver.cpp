@@ -49,6 +49,13 @@ void addChange(PyObject* set, PyObject* name) {
     py::checkStatus(PySet_Add(set, name));
 }
 
+void requireRunPlaced(Py_ssize_t end, Py_ssize_t at) {
+    if (end > at) return;
+    assertThat(false);
+    PyErr_Format(PyExc_RuntimeError, msg::kCommentRunStuck, end, at);
+    py::fail();
+}
+
 void requireStrOrNone(PyObject* name) {
     if (name != Py_None && !PyString_CheckExact(name)) msg::raiseExpectedType("str", name);
 }
@@ -143,7 +150,9 @@ namespace {
 
 // Runs _Clear on every way out of FindChanges. On the way out of a failure
 // the pending exception is set aside while _Clear runs and raised again
-// unless _Clear raised one of its own.
+// unless _Clear raised one of its own. An override of _Clear that fails
+// would leave the call marked as in progress, refusing every later call:
+// the built-in clear then makes the finder idle before its error goes on.
 class ClearOnExit {
 public:
     explicit ClearOnExit(PyObject* self) noexcept : self_(self) {}
@@ -153,7 +162,12 @@ public:
     // The success path: a failing _Clear fails the call.
     void finish() {
         done_ = true;
-        route::Clear(self_);
+        try {
+            route::Clear(self_);
+        } catch (...) {
+            Clear(self_);
+            throw;
+        }
     }
 
     ~ClearOnExit() {
@@ -165,6 +179,7 @@ public:
             pending.restore();
         } catch (...) {
             py::setErrorFromCurrentException();  // replaces the pending one
+            Clear(self_);
         }
     }
 
@@ -207,11 +222,33 @@ py::Ref findChangesGuarded(PyObject* self, PyObject* addedList, PyObject* remove
 
 }  // namespace
 
+// The editor protocol. Between two calls the caller edits the list in place
+// and then passes what it inserted (added_list) and what it took out
+// (removed_list). A removed logical is mapped to the place it left by its
+// line number: IndexForLineno gives the first logical whose fLineno is at
+// least that number, and the visit starts there. So every logical in the
+// list must carry its current line number, and a removed one the number it
+// had just before its own change. In a call that carries several changes
+// (an edit in many places, a replace-all) the changes count as applied top
+// to bottom, each seeing the line numbers the changes above it left: a
+// removed logical below a change that added or removed lines carries its
+// number shifted by that change. A number from before the whole batch would
+// point above or below the place the logical left; the logical standing
+// there is then not visited unless something else leads to it, and lines
+// that took their scope from the removed one can keep stale names. A call
+// with one change is the same under both readings.
 py::Ref FindChanges(PyObject* self, PyObject* addedList, PyObject* removedList) {
     if (finderState(self).contentsChanges != Py_None) msg::raise(PyExc_ValueError, msg::kRecursive);
     // The finder must outlive the call, whatever the steps' overrides drop.
     py::Ref keepSelf = py::Ref::own(self);
-    route::PrepareForFind(self);
+    try {
+        route::PrepareForFind(self);
+    } catch (...) {
+        // _Clear is not called here, but an override that failed after the
+        // base step must not leave the finder marked as in a call.
+        Clear(self);
+        throw;
+    }
     assert(mayOverride(self, Step::PrepareForFind) || isPrepared(self));
     py::Ref result;
     {

@@ -39,6 +39,21 @@ Py_ssize_t startOfUnprocessedWhitespace(PyObject* self, Py_ssize_t i) {
     return b;
 }
 
+// Whether list[i] is `logical` (no wrap-around for a negative i).
+bool isItemAt(PyObject* self, Py_ssize_t i, PyObject* logical) {
+    PyObject* list = finderState(self).logicalList;
+    return list != Py_None && i >= 0 && i < PyList_GET_SIZE(list) && PyList_GET_ITEM(list, i) == logical;
+}
+
+Py_ssize_t indexByIdentity(PyObject* self, PyObject* logical) {
+    PyObject* list = finderState(self).logicalList;
+    if (list == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
+    for (Py_ssize_t j = 0; j < PyList_GET_SIZE(list); ++j) {
+        if (PyList_GET_ITEM(list, j) == logical) return j;
+    }
+    return -1;
+}
+
 PyObject* requireIndexList(PyObject* indices, const char* method) {
     if (indices == Py_None) msg::raiseNoneAttribute(method);
     return indices;
@@ -52,8 +67,18 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
     if (addedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
     for (Py_ssize_t k = 0; k < PyList_GET_SIZE(addedList); ++k) {
         LogicalRef item = LogicalRef::own(PyList_GET_ITEM(addedList, k));
-        const Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get());
+        Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get());
         assertListItemIs(self, i, item.get());
+        // Optimised, nothing above caught an answer that is not where the
+        // logical stands: look for it, and skip one that is not in the list
+        // rather than name whatever stands at the answer.
+        if (!isItemAt(self, i, item.get())) i = indexByIdentity(self, item.get());
+        if (i < 0) continue;
+        // An added logical is new whatever it carries (an undo may put back
+        // the very objects it removed, with their old names): it is named
+        // afresh, so the scan it starts is not cut short by stale names.
+        setScopeName(item.record(), nullptr);
+        setLocalScopeDefined(item.record(), nullptr);
         py::Ref value = py::check(PyInt_FromSsize_t(i));
         py::checkStatus(PyList_Append(requireIndexList(indices, "append"), value.get()));
     }
@@ -81,8 +106,8 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
         if (whitespace || first < i) {
             bringScopesSeenUpTo(self, first);
             const Py_ssize_t r = route::ProcessDedentedComments(self, first);
+            requireRunPlaced(r, whitespace ? i : first);
             if (whitespace) {
-                assertThat(r > i);
                 s.lastProcessedIndex = r - 1;
                 resume = r;
                 // A run that reaches the end of the list leaves nothing to visit.
@@ -165,7 +190,7 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedI
             // Placed with the rest of its run; an unchanged comment says
             // nothing about the code after it, so the scan goes on.
             const Py_ssize_t r = route::ProcessDedentedComments(self, k);
-            if (r <= k) return;
+            requireRunPlaced(r, k);
             k = r;
             continue;
         }

@@ -26,14 +26,21 @@ PyObject* requireTable(PyObject* self) {
     return table;
 }
 
-bool startsWith(PyObject* name, PyObject* prefix) {
+// Whether `name` is the scope `prefix` or a scope nested in it: the prefix
+// must end at a separator, so that renaming f#1 leaves f#10 alone.
+bool inScope(PyObject* name, PyObject* prefix) {
     if (PyString_CheckExact(name) && PyString_CheckExact(prefix)) {
         const Py_ssize_t n = PyString_GET_SIZE(prefix);
-        return PyString_GET_SIZE(name) >= n &&
-               std::memcmp(PyString_AS_STRING(name), PyString_AS_STRING(prefix), n) == 0;
+        const Py_ssize_t size = PyString_GET_SIZE(name);
+        return size >= n && std::memcmp(PyString_AS_STRING(name), PyString_AS_STRING(prefix), n) == 0 &&
+               (size == n || PyString_AS_STRING(name)[n] == '.');
     }
     py::Ref r = py::check(PyObject_CallMethodObjArgs(name, gNames.startswith, prefix, nullptr));
-    return py::truth(r.get());
+    if (!py::truth(r.get())) return false;
+    const Py_ssize_t n = py::checkSize(PyObject_Size(prefix));
+    if (py::checkSize(PyObject_Size(name)) == n) return true;
+    py::Ref next = py::check(PySequence_GetItem(name, n));
+    return py::checkStatus(PyObject_RichCompareBool(next.get(), gNames.dot, Py_EQ)) != 0;
 }
 
 // new_prefix + name[len(old_prefix):]
@@ -134,7 +141,7 @@ void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName, Py
         // A logical added in this call and not yet visited has no name; it
         // is named when visited.
         if (name.isNone()) continue;
-        if (!startsWith(name.get(), oldScopeName)) {
+        if (!inScope(name.get(), oldScopeName)) {
             // Comments after the body may sit in the parent scope while
             // deeper ones after them are still in the body.
             if (isWhitespace(item.record())) continue;

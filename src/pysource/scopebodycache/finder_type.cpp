@@ -56,7 +56,7 @@ using Slots = DestroyableSubclass<FinderState, &gFinderStateOffset>;
 
 int finder_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
-        setLogicalList(self, initDestroyableSubclass(self, args, kwargs));
+        setLogicalList(self, initDestroyableSubclass(self, args, kwargs).get());
         route::Clear(self);
         return 0;
     });

@@ -29,10 +29,8 @@ void FindChangesEntireListAdded(PyObject* self) {
         const int indent = logical->fIndent;
         if (isWhitespace(logical.record()) && indent <= stack.back().indent) {
             const Py_ssize_t next = route::ProcessDedentedComments(self, i);
-            // The step reports its own failures and answers 0; restarting
-            // the walk there could loop for ever.
-            assertThat(next > i);
-            i = next > i ? next : i + 1;
+            requireRunPlaced(next, i);
+            i = next;
             continue;
         }
         while (indent <= stack.back().indent) {

@@ -58,10 +58,10 @@ int indexOfParam(const FunctionSpec& spec, PyObject* key) {
 
 }  // namespace
 
-void parseArgs(const FunctionSpec& spec, PyObject* args, PyObject* kwargs, PyObject** argv) {
-    const Py_ssize_t nargs = PyTuple_GET_SIZE(args);
+void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObject* kwargs,
+               ParsedArgs& out) {
+    const Py_ssize_t nargs = PyTuple_GET_SIZE(args) - first;
     const bool haveKeywords = kwargs != nullptr && PyDict_Size(kwargs) > 0;
-    for (int i = 0; i < spec.total; ++i) argv[i] = nullptr;
 
     // Functions without parameters and single-parameter ones take no keywords.
     const bool noKeywords = spec.total == 0 || (spec.total == 1 && spec.required == 1 && !spec.isInit);
@@ -81,7 +81,7 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, PyObject* kwargs, PyObj
         }
     } else {
         if (nargs > spec.total) countError(spec, nargs);
-        for (Py_ssize_t i = 0; i < nargs; ++i) argv[i] = PyTuple_GET_ITEM(args, i);
+        for (Py_ssize_t i = 0; i < nargs; ++i) out.set(static_cast<int>(i), PyTuple_GET_ITEM(args, first + i));
         if (haveKeywords) {
             // Required parameters missing from both are reported before any
             // keyword is judged.
@@ -89,7 +89,7 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, PyObject* kwargs, PyObj
             for (int i = static_cast<int>(nargs); i < spec.total; ++i) {
                 PyObject* v = PyDict_GetItemString(kwargs, spec.params[i].name);
                 if (v != nullptr) {
-                    argv[i] = v;
+                    out.set(i, v);
                     ++taken;
                 } else if (i < spec.required) {
                     countError(spec, i);
@@ -123,12 +123,12 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, PyObject* kwargs, PyObj
             countError(spec, nargs);
         }
     }
-    if (noKeywords && spec.total == 1) argv[0] = PyTuple_GET_ITEM(args, 0);
+    if (noKeywords && spec.total == 1) out.set(0, PyTuple_GET_ITEM(args, first));
 
     for (int i = 0; i < spec.total; ++i) {
         PyTypeObject* type;
         const char* typeName = checkTypeName(spec.params[i].check, &type);
-        PyObject* v = argv[i];
+        PyObject* v = out[i];
         if (type == nullptr || v == nullptr || v == Py_None || Py_TYPE(v) == type) continue;
         PyErr_Format(PyExc_TypeError,
                      "Argument '%.200s' has incorrect type (expected %.200s, got %.200s)",
@@ -143,7 +143,6 @@ PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
     auto* f = reinterpret_cast<FunctionObject*>(op);
     return py::guarded([&]() -> PyObject* {
         PyObject* self = nullptr;
-        py::Ref rest;
         if (f->isMethod) {
             // Reached unbound, the first argument is the instance.
             if (PyTuple_GET_SIZE(args) < 1) {
@@ -159,12 +158,10 @@ PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
                              PyString_AS_STRING(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
                 py::fail();
             }
-            rest = py::check(PyTuple_GetSlice(args, 1, PyTuple_GET_SIZE(args)));
-            args = rest.get();
         }
-        PyObject* argv[kMaxParams];
-        parseArgs(*f->spec, args, kwargs, argv);
-        return f->spec->impl(self, argv);
+        ParsedArgs parsed;
+        parseArgs(*f->spec, args, f->isMethod ? 1 : 0, kwargs, parsed);
+        return f->spec->impl(self, parsed.argv());
     });
 }
 

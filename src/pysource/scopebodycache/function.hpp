@@ -39,9 +39,27 @@ struct FunctionSpec {
     bool isInit = false;
 };
 
-// Parses `args`/`kwargs` by `spec` into argv[0..spec.total). Throws with the
-// interpreter's argument error set.
-void parseArgs(const FunctionSpec& spec, PyObject* args, PyObject* kwargs, PyObject** argv);
+// Parsed arguments. Each is held for the whole call: one given by keyword is
+// borrowed from the caller's own dict, which Python code run by the call (an
+// override, a key's __eq__ during the parse) may clear.
+class ParsedArgs {
+public:
+    void set(int i, PyObject* value) {
+        held_[i] = py::Ref::own(value);
+        argv_[i] = value;
+    }
+    PyObject* const* argv() const noexcept { return argv_; }
+    PyObject* operator[](int i) const noexcept { return argv_[i]; }
+
+private:
+    PyObject* argv_[kMaxParams] = {};  // nullptr: an optional one not given
+    py::Ref held_[kMaxParams];
+};
+
+// Parses args[first:] and `kwargs` by `spec`. Throws with the interpreter's
+// argument error set.
+void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObject* kwargs,
+               ParsedArgs& out);
 
 // Makes the function type ready; once, at import.
 void readyFunctionType();
