@@ -29,6 +29,9 @@ inline constexpr const char* kRecursive = "FindChanges cannot be called recursiv
 inline constexpr const char* kNoScopeFound = "No logical found for scope name: {}";
 inline constexpr const char* kMustStartScope = "logical must start a scope: {}";
 inline constexpr const char* kDefNotInList = "scope defining logical is not in logical list";
+inline constexpr const char* kScopeNotFound =
+    "the logical at index %zd cannot be given a scope name: a logical before it has none yet "
+    "(one inserted without being passed as added?)";
 inline constexpr const char* kCommentRunStuck =
     "_ProcessDedentedComments answered %zd for the comment or blank line at index %zd, so the "
     "lines from there could not be given scope names (the step reported why)";

@@ -62,10 +62,8 @@ inline PyObject* scopeName(const Logical* l) noexcept {
 
 inline void setScopeName(Logical* l, PyObject* name) noexcept { py::storeSlot(&l->fScopeName, name); }
 
-// The defined name: fLocalScopeName when set, else the name token of a
-// class/def line; nullptr when there is none. Borrowed.
-inline PyObject* localScopeDefined(const Logical* l) noexcept {
-    if (l->fLocalScopeName != nullptr && l->fLocalScopeName != Py_None) return l->fLocalScopeName;
+// The name token of a class/def line; nullptr when there is none. Borrowed.
+inline PyObject* definedToken(const Logical* l) noexcept {
     const bool isDef = l->fKind == kDefLogical;
     if (!isDef && l->fKind != kClassLogical) return nullptr;
     const char* keyword = isDef ? "def" : "class";
@@ -79,6 +77,13 @@ inline PyObject* localScopeDefined(const Logical* l) noexcept {
         return token;
     }
     return nullptr;
+}
+
+// The defined name: fLocalScopeName when set, else the name token of a
+// class/def line; nullptr when there is none. Borrowed.
+inline PyObject* localScopeDefined(const Logical* l) noexcept {
+    if (l->fLocalScopeName != nullptr && l->fLocalScopeName != Py_None) return l->fLocalScopeName;
+    return definedToken(l);
 }
 
 // As localScopeDefined, with the exact-str test of the Python entry point.

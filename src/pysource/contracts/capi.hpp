@@ -19,7 +19,29 @@ inline constexpr const char* kJoinTwo = "PyObject *(PyObject *, PyObject *, int)
 inline constexpr const char* kSplitOne = "PyObject *(PyObject *, int)";
 inline constexpr const char* kAppendSuffixes =
     "PyObject *(PyObject *, PyObject *, PyObject *, int)";
+// Optional entries: the native forms of the siblings' Python-level
+// functions. A sibling may publish them beside the Python functions of the
+// same names; a client that finds them may call them instead, with the same
+// results, while those functions are still the ones the sibling published.
+inline constexpr const char* kIndexForLineno = "Py_ssize_t (PyObject *, long)";
+inline constexpr const char* kFindIndexOfLogical = "Py_ssize_t (PyObject *, PyObject *)";
+inline constexpr const char* kLeafScopeNameHasIndex = "int (PyObject *)";
+inline constexpr const char* kScopeNameSuffix = "Py_ssize_t (PyObject *, Py_ssize_t *)";
 }  // namespace sig
+
+// pysource._fastaccess. IndexForLineno: -1 with an exception set on
+// failure. FindIndexOfLogical: -1 when the list does not hold the object (or
+// with an exception set when the first argument is not a list).
+using IndexForLinenoFn = Py_ssize_t (*)(PyObject* list, long lineno);
+using FindIndexOfLogicalFn = Py_ssize_t (*)(PyObject* list, PyObject* logical);
+// pysource.symbolinfo. LeafScopeNameHasIndex never fails. ScopeNameSuffix
+// reads the scope index a defined name carries without building objects:
+// the index, -1 when the name carries none (or is not a str), or
+// kSuffixTooLarge when it carries one too large for a Py_ssize_t; *bareLength
+// is set to the length of the name without its suffix.
+using LeafScopeNameHasIndexFn = int (*)(PyObject* name);
+using ScopeNameSuffixFn = Py_ssize_t (*)(PyObject* name, Py_ssize_t* bareLength);
+inline constexpr Py_ssize_t kSuffixTooLarge = -2;
 
 // Function entry points of pysource.symbolinfo. The trailing flag tells the
 // function to skip looking for a Python-level override; callers pass 0.

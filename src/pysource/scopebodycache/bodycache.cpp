@@ -161,11 +161,14 @@ py::Ref findBodyOfScopeDef(PyObject* self, PyObject* scopeDef) {
     const Py_ssize_t end = PyList_GET_SIZE(list.get());
     py::Ref body = py::check(PyList_New(0));
     long nestedIndent = -1;  // -1: not inside a nested class or def
-    // No Python code runs in this loop, but the length was taken once: a
-    // list that shrank since is an IndexError as for list[i].
+    // No Python code runs in this loop, but the length was taken once, and
+    // a rebound FindIndexOfLogical may answer below -1: list[i] as Python
+    // indexes it, negative counting from the end, IndexError outside.
     for (Py_ssize_t i = first; i < end; ++i) {
-        if (i >= PyList_GET_SIZE(list.get())) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
-        PyObject* logical = PyList_GET_ITEM(list.get(), i);
+        const Py_ssize_t size = PyList_GET_SIZE(list.get());
+        const Py_ssize_t at = i < 0 ? i + size : i;
+        if (at < 0 || at >= size) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
+        PyObject* logical = PyList_GET_ITEM(list.get(), at);
         const Logical* l = requireLogical(logical);
         if (isWhitespace(l)) continue;
         const long indent = l->fIndent;

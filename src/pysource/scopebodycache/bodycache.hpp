@@ -25,6 +25,8 @@ struct BodyCacheState {
     void forEachObject(Visit&& visit) {
         SBC_BODY_CACHE_FIELDS(SBC_FIELD_VISIT)
     }
+    int traverseInternal(visitproc, void*) const { return 0; }
+    void clearInternal() noexcept {}
 };
 
 // Our fields follow whatever instance size the base class has at import.

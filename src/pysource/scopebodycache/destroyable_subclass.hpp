@@ -11,7 +11,8 @@
 namespace sbc {
 
 // State: the class's state block, with forEachObject(visit) over its
-// object fields (fields.hpp); Offset: where the block starts.
+// object fields (fields.hpp) and traverseInternal/clearInternal for the
+// references its internal state holds; Offset: where the block starts.
 template <class State, Py_ssize_t* Offset>
 struct DestroyableSubclass {
     static State& state(PyObject* self) noexcept { return contracts::stateAt<State>(self, *Offset); }
@@ -40,6 +41,7 @@ struct DestroyableSubclass {
             if (status == 0 && field != nullptr) status = visit(field, arg);
         });
         if (status != 0) return status;
+        if ((status = state(self).traverseInternal(visit, arg)) != 0) return status;
         if (baseSlotsChain()) {
             return gDestroyableType->tp_traverse ? gDestroyableType->tp_traverse(self, visit, arg) : 0;
         }
@@ -49,6 +51,7 @@ struct DestroyableSubclass {
 
     static int tp_clear(PyObject* self) {
         state(self).forEachObject([](PyObject*& field) { py::storeSlot(&field, Py_None); });
+        state(self).clearInternal();
         if (baseSlotsChain()) return gDestroyableType->tp_clear ? gDestroyableType->tp_clear(self) : 0;
         py::storeSlot(&base(self)->fSignalCatchers, Py_None);
         return 0;
@@ -57,6 +60,7 @@ struct DestroyableSubclass {
     static void tp_dealloc(PyObject* self) {
         PyObject_GC_UnTrack(self);
         state(self).forEachObject([](PyObject*& field) { Py_CLEAR(field); });
+        state(self).clearInternal();
         if (baseSlotsChain()) {
             gDestroyableType->tp_dealloc(self);
             return;

@@ -61,6 +61,8 @@
 #include "pysource/contracts/destroyable_base.hpp"
 #include "pysource/scopebodycache/fields.hpp"
 
+#include <vector>
+
 namespace sbc {
 
 // The pickled fields of a finder, after the base class's two, in the order
@@ -78,18 +80,42 @@ namespace sbc {
     X(Index, nextChangeIndex, "_fNextChangeIndex", index)                   \
     X(Object, scopesSeen, "_fScopesSeen", dict)
 
+class DefIndex;
+struct NativePass;
+
 struct FinderState {
     SBC_FINDER_FIELDS(SBC_FIELD_MEMBER)
-    // Internal, never pickled: the least indent among the logicals a
-    // forward scan changed before _fNextChangeIndex cut it short
-    // (kNoScanOwed when none). The next visit carries that scan on.
+    // Internal, never pickled:
+    // - the least indent among the logicals a forward scan changed before
+    //   _fNextChangeIndex cut it short (kNoScanOwed when none); the next
+    //   visit carries that scan on;
     long owedScanIndent;
+    // - the native pass of the call in progress (null otherwise);
+    NativePass* native;
+    // - the definition index, kept between calls while it matches the list.
+    DefIndex* defIndex;
 
     // Each object field, for the slots (allocation, gc, deallocation).
     template <class Visit>
     void forEachObject(Visit&& visit) {
         SBC_FINDER_FIELDS(SBC_FIELD_VISIT)
     }
+    // The references internal state holds, for the garbage collector.
+    int traverseInternal(visitproc visit, void* arg) const;
+    void clearInternal() noexcept;
+};
+
+// The native pass: the mode a FindChanges call runs in when no step is
+// overridden and every sibling function the module looks up by name is
+// still the one bound at import. It runs the same steps, but calls them
+// directly, calls the siblings' native forms, keeps the index list in a
+// vector and takes scope indices from the definition index instead of the
+// scopes-seen table (which stays None; nothing can look at it during the
+// call). Where the index cannot be used, the table walk takes over.
+struct NativePass {
+    DefIndex* index = nullptr;    // the finder's index, or null: the table walk
+    bool indexBuilt = false;      // false: rebuild from the list at first use
+    DefIndex* dropped = nullptr;  // dropped during the call; freed at its end
 };
 
 inline constexpr long kNoScanOwed = 1L << 20;
@@ -101,6 +127,8 @@ inline FinderState& finderState(PyObject* self) noexcept {
     return contracts::stateAt<FinderState>(self, gFinderStateOffset);
 }
 
+inline bool nativePass(PyObject* self) noexcept { return finderState(self).native != nullptr; }
+
 PyTypeObject* changeFinderType() noexcept;
 void readyChangeFinderType();
 void bindChangeFinderMethods();
@@ -108,6 +136,40 @@ void bindChangeFinderMethods();
 inline void setLogicalList(PyObject* self, PyObject* value) {
     storeTyped(&finderState(self).logicalList, value, &PyList_Type, "list");
 }
+
+// The definition index of the native pass, built from the list at its
+// first use in a call; null when the call takes scope indices from the
+// table walk.
+DefIndex* definitionIndex(PyObject* self);
+// Drops the finder's definition index: it cannot be shown to match the
+// list (a direct call of a step, an exception, new state, a name it cannot
+// file). The call in progress goes on with the table walk.
+void dropDefinitionIndex(PyObject* self) noexcept;
+// When set, every native call ends by comparing the definition index with
+// the list (SystemError when they differ): the self-check of the replay,
+// turned on by SBC_CHECK_INDEX=1 in the environment at import.
+extern bool gCheckDefinitionIndex;
+// The native pass keeps the index in step with the names it stores: a
+// class/def logical at `i` filed under its stored names, or taken out.
+void fileDefinition(PyObject* self, PyObject* logical, Py_ssize_t i);
+void unfileDefinition(PyObject* self, PyObject* logical);
+
+// The index list of the incremental pass: the Python list callers and
+// overrides see, or, in the native pass, a vector.
+class IndexList {
+public:
+    explicit IndexList(PyObject* list) noexcept : list_(list) {}
+    explicit IndexList(std::vector<Py_ssize_t>* vector) noexcept : vector_(vector) {}
+    Py_ssize_t size() const;
+    Py_ssize_t at(Py_ssize_t k) const;
+    void append(Py_ssize_t value);
+    void sort();
+    void insert(Py_ssize_t k, Py_ssize_t value);
+
+private:
+    PyObject* list_ = nullptr;  // borrowed; None gives the AttributeErrors of None
+    std::vector<Py_ssize_t>* vector_ = nullptr;
+};
 
 // Shared helpers of the passes.
 bool assertionsOn() noexcept;
@@ -125,6 +187,11 @@ void addChange(PyObject* set, PyObject* name);
 // AssertionError where the steps assert; optimised, going on would loop or
 // return with the run unnamed, so it is a RuntimeError.
 void requireRunPlaced(Py_ssize_t end, Py_ssize_t at);
+// The scope found for the logical at `i` by looking back: None means a
+// logical before it has no name yet, which only a logical inserted without
+// being passed as added can cause. AssertionError where the steps assert;
+// optimised, naming on would store None, so it is a RuntimeError.
+void requireScopeFound(PyObject* scope, Py_ssize_t i);
 // A scope name about to be stored or used: str or None, else TypeError.
 void requireStrOrNone(PyObject* name);
 // `a, b = seq` (exactly two items) or, with firstTwo, `a, b = seq[:2]`.
@@ -143,6 +210,9 @@ void FindChangesEntireListAdded(PyObject* self);
 py::Ref GetLeafScopeWithIndex(PyObject* self, PyObject* logical, Py_ssize_t scopeIndex);
 py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList);
 void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices);
+// The bodies of the two, on either kind of index list.
+void processRemoved(PyObject* self, PyObject* removedList, IndexList& indices);
+void processAdded(PyObject* self, PyObject* addedList, IndexList& indices);
 Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first);
 void LogicalInScopeChanged(PyObject* self, PyObject* logical, PyObject* scopeName,
                            PyObject* oldContainingScope, PyObject* oldLeafScope);
@@ -159,6 +229,9 @@ py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i);
 void ProcessNonDedentedComment(PyObject* self, PyObject* logical, Py_ssize_t i);
 void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedIndent);
 void UpdateScopesSeen(PyObject* self, Py_ssize_t end);
+// The whole-list pass's count of the definition at `at`: the definition
+// index when the pass has one, else UpdateScopesSeenWithStartScopeLogical.
+Py_ssize_t CountDefinition(PyObject* self, PyObject* logical, Py_ssize_t at, PyObject* scopeName);
 Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logical,
                                                  PyObject* scopeName, bool nameIsBare);
 }  // namespace finder

@@ -10,25 +10,29 @@ using namespace contracts;
 py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList) {
     if (removedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
     py::Ref result = py::check(PyList_New(0));
+    IndexList indices(result.get());
+    processRemoved(self, removedList, indices);
+    return result;
+}
+
+void processRemoved(PyObject* self, PyObject* removedList, IndexList& result) {
+    const bool native = nativePass(self);
     Py_ssize_t lastIndex = -1;
     for (Py_ssize_t k = 0; k < PyList_GET_SIZE(removedList); ++k) {
         LogicalRef logical = LogicalRef::own(PyList_GET_ITEM(removedList, k));
         py::Ref scope = py::Ref::own(scopeName(logical.record()));
         if (scope.isNone()) continue;
+        if (isScopeStart(logical.record())) unfileDefinition(self, logical.get());
         route::LogicalInScopeChanged(self, logical.get(), scope.get());
-        Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno);
+        Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno, native);
         // A logical removed from the end of the list still moves the comment
         // and blank lines before it (they took their scope from it): the last
         // logical stands in its place.
         const Py_ssize_t n = logicalListLength(self);
         if (index >= n && n > 0) index = n - 1;
-        if (index != lastIndex && index >= 0 && index < n) {
-            py::Ref value = py::check(PyInt_FromSsize_t(index));
-            py::checkStatus(PyList_Append(result.get(), value.get()));
-        }
+        if (index != lastIndex && index >= 0 && index < n) result.append(index);
         lastIndex = index;
     }
-    return result;
 }
 
 void LogicalInScopeChanged(PyObject* self, PyObject* logicalObj, PyObject* scopeName,

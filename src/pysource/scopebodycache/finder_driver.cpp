@@ -1,8 +1,11 @@
 // The finder's life cycle and the FindChanges driver.
 #include "common/messages.hpp"
+#include "pysource/scopebodycache/def_index.hpp"
 #include "pysource/scopebodycache/dispatch.hpp"
 #include "pysource/scopebodycache/finder.hpp"
+#include "pysource/scopebodycache/fullname.hpp"
 #include "pysource/scopebodycache/route.hpp"
+#include "pysource/scopebodycache/siblings.hpp"
 
 #include <cassert>
 
@@ -53,6 +56,13 @@ void requireRunPlaced(Py_ssize_t end, Py_ssize_t at) {
     if (end > at) return;
     assertThat(false);
     PyErr_Format(PyExc_RuntimeError, msg::kCommentRunStuck, end, at);
+    py::fail();
+}
+
+void requireScopeFound(PyObject* scope, Py_ssize_t i) {
+    if (scope != Py_None) return;
+    assertThat(false);
+    PyErr_Format(PyExc_RuntimeError, msg::kScopeNotFound, i);
     py::fail();
 }
 
@@ -188,6 +198,29 @@ private:
     bool done_ = false;
 };
 
+py::Ref resultTuple(const FinderState& s) {
+    py::Ref result = py::check(PyTuple_New(3));
+    PyObject* items[3] = {s.contentsChanges, s.classChanges, s.functionChanges};
+    for (int k = 0; k < 3; ++k) {
+        Py_INCREF(items[k]);
+        PyTuple_SET_ITEM(result.get(), k, items[k]);
+    }
+    return result;
+}
+
+// After a pass whose visits changed a definition: the definitions after it
+// that share its key are renumbered to the end of the list.
+void renumberToEnd(PyObject* self) {
+    FinderState& s = finderState(self);
+    const bool scopesChanged = py::checkSize(PyObject_Size(s.classChanges)) != 0 ||
+                               py::checkSize(PyObject_Size(s.functionChanges)) != 0;
+    if (!scopesChanged) return;
+    const Py_ssize_t n = logicalListLength(self);
+    s.nextChangeIndex = n;
+    // A pass may already have covered the whole list.
+    if (n > s.endIndexForScopesSeen || nativePass(self)) UpdateScopesSeen(self, n);
+}
+
 py::Ref findChangesGuarded(PyObject* self, PyObject* addedList, PyObject* removedList) {
     FinderState& s = finderState(self);
     if (addedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
@@ -202,25 +235,116 @@ py::Ref findChangesGuarded(PyObject* self, PyObject* addedList, PyObject* remove
             msg::raiseExpectedType("list", indices.get());
         }
         route::ProcessAddedLogicals(self, addedList, indices.get());
-        const bool scopesChanged = py::checkSize(PyObject_Size(s.classChanges)) != 0 ||
-                                   py::checkSize(PyObject_Size(s.functionChanges)) != 0;
-        if (scopesChanged) {
-            const Py_ssize_t n = logicalListLength(self);
-            s.nextChangeIndex = n;
-            // A pass may already have covered the whole list.
-            if (n > s.endIndexForScopesSeen) UpdateScopesSeen(self, n);
+        renumberToEnd(self);
+    }
+    return resultTuple(s);
+}
+
+// --- The native pass ------------------------------------------------------------
+
+bool anyStepOverridden(PyObject* self) noexcept {
+    PyTypeObject* type = Py_TYPE(self);
+    if (!(type->tp_flags & Py_TPFLAGS_HEAPTYPE) && type->tp_dictoffset == 0) return false;
+    for (int k = 0; k < static_cast<int>(Step::Count); ++k) {
+        if (mayOverride(self, static_cast<Step>(k))) return true;
+    }
+    return false;
+}
+
+// The native pass's hold on the finder for one call: on every way out it
+// ends, and the index it dropped, with the references the index let go
+// during the call, are released once nothing uses them.
+class NativeCall {
+public:
+    explicit NativeCall(PyObject* self) noexcept : state_(finderState(self)) { state_.native = &pass_; }
+    NativeCall(const NativeCall&) = delete;
+    NativeCall& operator=(const NativeCall&) = delete;
+    ~NativeCall() {
+        state_.native = nullptr;
+        delete pass_.dropped;
+        if (state_.defIndex != nullptr) state_.defIndex->flushReleases();
+    }
+    NativePass& pass() noexcept { return pass_; }
+
+private:
+    FinderState& state_;
+    NativePass pass_;
+};
+
+// What the index must show to be used for this call: built for this very
+// list, which has since changed by exactly the logicals passed in.
+bool indexStillMatches(const FinderState& s, Py_ssize_t added, Py_ssize_t removed) {
+    const DefIndex* index = s.defIndex;
+    return index != nullptr && index->list() == s.logicalList &&
+           index->recordedLength + added - removed == PyList_GET_SIZE(s.logicalList);
+}
+
+py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removedList) {
+    FinderState& s = finderState(self);
+    NativeCall call(self);
+    NativePass& pass = call.pass();
+    // As _PrepareForFind, but for the scopes-seen table, which only the
+    // table walk needs (made then).
+    py::storeSlot(&s.classChanges, py::check(PySet_New(nullptr)).get());
+    py::storeSlot(&s.functionChanges, py::check(PySet_New(nullptr)).get());
+    py::storeSlot(&s.contentsChanges, py::check(PySet_New(nullptr)).get());
+    s.endIndexForScopesSeen = 0;
+    s.nextChangeIndex = -1;
+    s.lastProcessedIndex = -1;
+    s.owedScanIndent = kNoScanOwed;
+
+    py::Ref result;
+    ClearOnExit clear(self);
+    try {
+        if (addedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
+        const Py_ssize_t added = PyList_GET_SIZE(addedList);
+        const Py_ssize_t total = logicalListLength(self);
+        if (removedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
+        std::vector<Py_ssize_t> indices;
+        IndexList list(&indices);
+        if (added == total) {
+            dropDefinitionIndex(self);
+            processRemoved(self, removedList, list);
+            // The whole-list pass counts every definition into a new index.
+            s.defIndex = new DefIndex(s.logicalList);
+            pass.index = s.defIndex;
+            pass.indexBuilt = true;
+            FindChangesEntireListAdded(self);
+        } else {
+            const bool matches = indexStillMatches(s, added, PyList_GET_SIZE(removedList));
+            if (!matches) {
+                dropDefinitionIndex(self);
+                s.defIndex = new DefIndex(s.logicalList);
+            }
+            pass.index = s.defIndex;
+            pass.indexBuilt = matches;
+            processRemoved(self, removedList, list);
+            processAdded(self, addedList, list);
+            renumberToEnd(self);
         }
+        result = resultTuple(s);
+        // Kept for the next call only if it is known to match the list.
+        if (s.defIndex != nullptr && (!pass.indexBuilt || s.defIndex->hasCandidates())) {
+            dropDefinitionIndex(self);
+        }
+        if (s.defIndex != nullptr) {
+            s.defIndex->recordedLength = PyList_GET_SIZE(s.logicalList);
+            std::string why;
+            if (gCheckDefinitionIndex && !s.defIndex->matchesList(&why)) {
+                PyErr_Format(PyExc_SystemError, "definition index out of step: %s", why.c_str());
+                py::fail();
+            }
+        }
+    } catch (...) {
+        dropDefinitionIndex(self);
+        throw;
     }
-    py::Ref result = py::check(PyTuple_New(3));
-    PyObject* items[3] = {s.contentsChanges, s.classChanges, s.functionChanges};
-    for (int k = 0; k < 3; ++k) {
-        Py_INCREF(items[k]);
-        PyTuple_SET_ITEM(result.get(), k, items[k]);
-    }
+    clear.finish();
     return result;
 }
 
 }  // namespace
+
 
 // The editor protocol. Between two calls the caller edits the list in place
 // and then passes what it inserted (added_list) and what it took out
@@ -241,6 +365,11 @@ py::Ref FindChanges(PyObject* self, PyObject* addedList, PyObject* removedList) 
     if (finderState(self).contentsChanges != Py_None) msg::raise(PyExc_ValueError, msg::kRecursive);
     // The finder must outlive the call, whatever the steps' overrides drop.
     py::Ref keepSelf = py::Ref::own(self);
+    if (!anyStepOverridden(self) && nativeSiblingsCurrent() && fullNameFunctionCurrent()) {
+        return findChangesNative(self, addedList, removedList);
+    }
+    // Overrides may store any names: the index cannot follow them.
+    dropDefinitionIndex(self);
     try {
         route::PrepareForFind(self);
     } catch (...) {

@@ -54,20 +54,21 @@ Py_ssize_t indexByIdentity(PyObject* self, PyObject* logical) {
     return -1;
 }
 
-PyObject* requireIndexList(PyObject* indices, const char* method) {
-    if (indices == Py_None) msg::raiseNoneAttribute(method);
-    return indices;
-}
-
 }  // namespace
 
 void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices) {
+    IndexList list(indices);
+    processAdded(self, addedList, list);
+}
+
+void processAdded(PyObject* self, PyObject* addedList, IndexList& indices) {
     FinderState& s = finderState(self);
+    const bool native = nativePass(self);
     s.lastProcessedIndex = -1;
     if (addedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
     for (Py_ssize_t k = 0; k < PyList_GET_SIZE(addedList); ++k) {
         LogicalRef item = LogicalRef::own(PyList_GET_ITEM(addedList, k));
-        Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get());
+        Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get(), native);
         assertListItemIs(self, i, item.get());
         // Optimised, nothing above caught an answer that is not where the
         // logical stands: look for it, and skip one that is not in the list
@@ -77,26 +78,24 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
         // An added logical is new whatever it carries (an undo may put back
         // the very objects it removed, with their old names): it is named
         // afresh, so the scan it starts is not cut short by stale names.
+        if (isScopeStart(item.record())) unfileDefinition(self, item.get());
         setScopeName(item.record(), nullptr);
         setLocalScopeDefined(item.record(), nullptr);
-        py::Ref value = py::check(PyInt_FromSsize_t(i));
-        py::checkStatus(PyList_Append(requireIndexList(indices, "append"), value.get()));
+        indices.append(i);
     }
-    py::checkStatus(PyList_Sort(requireIndexList(indices, "sort")));
+    indices.sort();
 
     Py_ssize_t resume = -1;
     Py_ssize_t position = 0;
-    while (position < PyList_GET_SIZE(indices)) {
-        const Py_ssize_t i = py::asIndex(PyList_GET_ITEM(indices, position));
+    while (position < indices.size()) {
+        const Py_ssize_t i = indices.at(position);
         ++position;
         LogicalRef item = logicalAt(self, i);
         if (resume != -1) {
             if (i < resume) continue;
             resume = -1;
         }
-        s.nextChangeIndex = position < PyList_GET_SIZE(indices)
-                                ? py::asIndex(PyList_GET_ITEM(indices, position))
-                                : logicalListLength(self);
+        s.nextChangeIndex = position < indices.size() ? indices.at(position) : logicalListLength(self);
         if (s.nextChangeIndex == i) continue;
 
         // Comment and blank lines take their scope from the code line after
@@ -113,15 +112,8 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
                 // A run that reaches the end of the list leaves nothing to visit.
                 if (r < logicalListLength(self)) {
                     Py_ssize_t at = position;
-                    while (at < PyList_GET_SIZE(indices) &&
-                           py::asIndex(PyList_GET_ITEM(indices, at)) < r) {
-                        ++at;
-                    }
-                    if (at == PyList_GET_SIZE(indices) ||
-                        py::asIndex(PyList_GET_ITEM(indices, at)) != r) {
-                        py::Ref value = py::check(PyInt_FromSsize_t(r));
-                        py::checkStatus(PyList_Insert(indices, at, value.get()));
-                    }
+                    while (at < indices.size() && indices.at(at) < r) ++at;
+                    if (at == indices.size() || indices.at(at) != r) indices.insert(at, r);
                 }
                 continue;
             }
@@ -135,7 +127,7 @@ void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices
 
 void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t i) {
     py::Ref scope = route::FindScopeNameContainingLogical(self, i);
-    assertThat(!scope.isNone());
+    requireScopeFound(scope.get(), i);
     requireStrOrNone(scope.get());
     LogicalRef held = LogicalRef::own(logicalObj);
     Logical* logical = held.record();
@@ -163,6 +155,7 @@ void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t 
             changed = true;
         }
     }
+    if (changed && isScopeStart(logical)) fileDefinition(self, logicalObj, i);
     // A scan cut short before this index is carried on from here.
     FinderState& s = finderState(self);
     const long owed = s.owedScanIndent;
@@ -171,7 +164,7 @@ void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t 
         if (owed < logical->fIndent) ScanForwardForChangedScopes(self, i + 1, owed);
         return;
     }
-    if (!previousLocal.isNone() && !leafScopeNameHasIndex(previousLocal.get())) {
+    if (!previousLocal.isNone() && !leafScopeNameHasIndex(previousLocal.get(), nativePass(self))) {
         previousLocal = py::Ref::none();
     }
     route::LogicalInScopeChanged(self, logicalObj, scope.get(), previous.get(), previousLocal.get());
@@ -195,10 +188,7 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedI
             continue;
         }
         py::Ref scope = route::FindScopeNameContainingLogical(self, k);
-        if (scope.isNone()) {
-            assertThat(false);
-            return;
-        }
+        requireScopeFound(scope.get(), k);
         if (py::checkStatus(PyObject_RichCompareBool(scope.get(), previous.get(), Py_EQ))) {
             if (item->fIndent <= changedIndent) return;
             ++k;

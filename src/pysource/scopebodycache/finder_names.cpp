@@ -1,6 +1,7 @@
 // Naming one logical at a time: its containing scope from the logicals
 // before it, the local name of a class/def for a scope index, and the
 // stores that record what changed.
+#include "pysource/scopebodycache/def_index.hpp"
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/fullname.hpp"
 #include "pysource/scopebodycache/names.hpp"
@@ -38,17 +39,24 @@ py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i) {
     // A class/def line without a name opens no scope: its body stays in
     // the enclosing scope, as the whole-list pass has it.
     if (indent > anchor->fIndent && isScopeStart(anchor) && localScopeDefined(anchor) != nullptr) {
-        return callGetFullNameForScopeDef(reinterpret_cast<PyObject*>(anchor));
+        return callGetFullNameForScopeDef(reinterpret_cast<PyObject*>(anchor), nativePass(self));
     }
     return py::Ref::own(anchor->fScopeName);
 }
 
-py::Ref GetLeafScopeWithIndex(PyObject*, PyObject* logicalObj, Py_ssize_t scopeIndex) {
+py::Ref GetLeafScopeWithIndex(PyObject* self, PyObject* logicalObj, Py_ssize_t scopeIndex) {
     if (scopeIndex < 0) return py::Ref::none();
     Logical* logical = requireLogical(logicalObj);
     py::Ref name = py::Ref::own(localScopeDefined(logical));
     if (!name) return py::Ref::none();
     py::Ref index = py::check(PyInt_FromSsize_t(scopeIndex));
+    if (nativePass(self)) {
+        DefinedName defined;
+        readDefinedName(logicalObj, &defined);
+        if (defined.index == -1) return appendScopeSuffixes(name.get(), index.get());
+        if (defined.index == scopeIndex) return name;
+        return appendScopeSuffixes(bareNameOf(logicalObj, defined).get(), index.get());
+    }
     if (leafScopeNameHasIndex(name.get())) {
         py::Ref split = splitScopeNameFromSuffixes(name.get());
         py::Ref bare, oldIndex;
@@ -77,10 +85,11 @@ py::Ref UpdateLogicalScopeName(PyObject* self, PyObject* logicalObj, Py_ssize_t 
         py::Ref newLocal = route::GetLeafScopeWithIndex(self, logicalObj, index);
         const bool differs = py::checkStatus(PyObject_RichCompareBool(
                                  newLocal.get(), oldLocal ? oldLocal.get() : Py_None, Py_NE)) != 0;
-        if (differs) {
-            setLocalScopeDefined(logical.record(), newLocal.get());
-            ScanForwardForChangedScopes(self, i + 1, logical->fIndent);
-        }
+        if (differs) setLocalScopeDefined(logical.record(), newLocal.get());
+        // Filed before the nested scan, which counts the definitions of
+        // this key after it.
+        fileDefinition(self, logicalObj, i);
+        if (differs) ScanForwardForChangedScopes(self, i + 1, logical->fIndent);
     }
     return py::Ref::own(scopeName);
 }

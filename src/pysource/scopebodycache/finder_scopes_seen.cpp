@@ -1,6 +1,7 @@
 // Scope indices: repeated definitions of one name in one scope are numbered
 // 0, 1, 2 in list order. The scopes-seen table counts definitions over a
 // growing prefix of the list and repairs the ones an edit has shifted.
+#include "pysource/scopebodycache/def_index.hpp"
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/route.hpp"
@@ -21,9 +22,14 @@ py::Ref bareName(PyObject* name) {
 }
 
 PyObject* requireTable(PyObject* self) {
-    PyObject* table = finderState(self).scopesSeen;
-    if (table == Py_None) msg::raise(PyExc_TypeError, msg::kNoneArgumentNotIterable);
-    return table;
+    FinderState& s = finderState(self);
+    // The native pass makes the table only when the index cannot serve.
+    if (s.scopesSeen == Py_None && s.native != nullptr) {
+        py::storeSlot(&s.scopesSeen, py::check(PyDict_New()).get());
+        s.endIndexForScopesSeen = 0;
+    }
+    if (s.scopesSeen == Py_None) msg::raise(PyExc_TypeError, msg::kNoneArgumentNotIterable);
+    return s.scopesSeen;
 }
 
 // Whether `name` is the scope `prefix` or a scope nested in it: the prefix
@@ -54,6 +60,68 @@ py::Ref replacePrefix(PyObject* name, PyObject* oldPrefix, PyObject* newPrefix) 
 
 namespace finder {
 
+namespace {
+
+// A definition at j whose stored index is not its count: it gets the
+// counted index, and the scopes nested in it are renamed with it. Shared by
+// the table walk and the definition index. hadIndex: 1 when the stored
+// name carried an index, 0 when not, -1 when it carried one too large to
+// read.
+void repairDefinition(PyObject* self, const LogicalRef& item, Py_ssize_t j, PyObject* scope,
+                      PyObject* local, PyObject* bare, int hadIndex, Py_ssize_t counted) {
+    FinderState& s = finderState(self);
+    py::Ref newIndex = py::check(PyInt_FromSsize_t(counted));
+    py::Ref newLocal = appendScopeSuffixes(bare, newIndex.get());
+    route::SetLogicalScopeNames(self, item.get(), j, scope, newLocal.get());
+    route::LogicalInScopeChanged(self, item.get(), scope);
+    if (hadIndex < 0) {
+        PyErr_SetString(PyExc_OverflowError, "Python int too large to convert to C long");
+        py::fail();
+    }
+    assertThat(hadIndex != 0);
+    if (hadIndex == 0) return;
+    py::Ref oldFull = joinTwoScopeNames(scope, local);
+    addChange(item->fKind == kClassLogical ? s.classChanges : s.functionChanges, oldFull.get());
+    py::Ref newFull = joinTwoScopeNames(scope, newLocal.get());
+    // The renamed body may reach past the end asked for: rename all of it
+    // now, or the lines beyond keep the old index (nothing comes back to
+    // this definition in this call).
+    route::PropagateScopeIndexChangeForward(self, oldFull.get(), newFull.get(), j + 1,
+                                            logicalListLength(self));
+}
+
+// The definition index's form of extending the table to `end`: the queued
+// definitions below it, in list order, are checked and repaired.
+void repairQueuedBefore(PyObject* self, Py_ssize_t end) {
+    DefIndex::Candidate candidate;
+    // A repair may drop the index (a name it cannot file): fetched afresh.
+    while (DefIndex* index = definitionIndex(self)) {
+        if (!index->popCandidate(end, &candidate)) return;
+        const Py_ssize_t position = index->positionOf(candidate.def.get());
+        if (position < 0) continue;  // no longer filed
+        DefinedName name;
+        readDefinedName(candidate.def.get(), &name);
+        if (name.index == position) continue;
+        LogicalRef item = LogicalRef::own(candidate.def.get());
+        py::Ref scope = py::Ref::own(scopeName(item.record()));
+        py::Ref local = py::Ref::own(name.name);
+        py::Ref bare = bareNameOf(item.get(), name);
+        const int hadIndex = name.index == kSuffixTooLarge ? -1 : name.index != -1;
+        repairDefinition(self, item, candidate.at, scope.get(), local.get(), bare.get(), hadIndex, position);
+    }
+}
+
+// Counting one definition into the index, as the whole-list pass does; the
+// definition's place is `at`. -1 when the index cannot take it.
+Py_ssize_t countIntoIndex(DefIndex* index, PyObject* logical, Py_ssize_t at, PyObject* scopeName) {
+    DefinedName name;
+    if (!readDefinedName(logical, &name)) return 0;
+    if (!PyString_CheckExact(scopeName) || !PyString_CheckExact(name.name)) return -1;
+    return index->append(logical, at, scopeName, name);
+}
+
+}  // namespace
+
 Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logicalObj,
                                                  PyObject* scopeName, bool nameIsBare) {
     py::Ref name = py::Ref::own(localScopeDefined(requireLogical(logicalObj)));
@@ -69,8 +137,30 @@ Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logic
     return index;
 }
 
+Py_ssize_t CountDefinition(PyObject* self, PyObject* logical, Py_ssize_t at, PyObject* scopeName) {
+    if (DefIndex* index = definitionIndex(self)) {
+        const Py_ssize_t counted = neverRaises(
+            unraisableContext(Step::UpdateScopesSeenWithStartScopeLogical), Py_ssize_t(0),
+            [&] { return countIntoIndex(index, logical, at, scopeName); });
+        if (counted >= 0) return counted;
+        dropDefinitionIndex(self);
+    }
+    return route::UpdateScopesSeenWithStartScopeLogical(self, logical, scopeName, false);
+}
+
 Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logicalObj, Py_ssize_t i) {
     FinderState& s = finderState(self);
+    if (definitionIndex(self) != nullptr) {
+        repairQueuedBefore(self, i);
+        LogicalRef logical = LogicalRef::own(logicalObj);
+        DefinedName name;
+        if (!readDefinedName(logical.get(), &name)) return 0;
+        if (DefIndex* index = definitionIndex(self)) {
+            const Py_ssize_t count = index->countBefore(scopeName(logical.record()), name, i);
+            if (count >= 0) return count;
+            dropDefinitionIndex(self);
+        }
+    }
     assertThat(i >= s.endIndexForScopesSeen);
     // The table may already reach i: the visiting loop brings it up to an
     // index before naming the logical there.
@@ -79,7 +169,7 @@ Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logicalObj, Py_ssi
     LogicalRef logical = LogicalRef::own(logicalObj);
     py::Ref name = py::Ref::own(localScopeDefined(logical.record()));
     if (!name) return 0;
-    if (leafScopeNameHasIndex(name.get())) name = bareName(name.get());
+    if (leafScopeNameHasIndex(name.get(), nativePass(self))) name = bareName(name.get());
     py::Ref key = joinTwoScopeNames(scopeName(logical.record()), name.get());
     PyObject* seen = PyDict_GetItem(requireTable(self), key.get());
     return seen ? py::asIndex(seen) + 1 : 0;
@@ -90,6 +180,10 @@ void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
     if (end == 0) return;
     const Py_ssize_t n = logicalListLength(self);
     if (end > n) end = n;
+    if (definitionIndex(self) != nullptr) {
+        repairQueuedBefore(self, end);
+        if (definitionIndex(self) != nullptr) return;
+    }
     if (end <= s.endIndexForScopesSeen) {
         assertThat(false);
         return;
@@ -102,7 +196,7 @@ void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
         py::Ref local = py::Ref::own(localScopeDefined(item.record()));
         if (!local) continue;  // nothing to number
         py::Ref bare, oldIndex;
-        if (leafScopeNameHasIndex(local.get())) {
+        if (leafScopeNameHasIndex(local.get(), nativePass(self))) {
             py::Ref split = splitScopeNameFromSuffixes(local.get());
             unpackPair(split.get(), &bare, &oldIndex, true);
         } else {
@@ -113,22 +207,9 @@ void UpdateScopesSeen(PyObject* self, Py_ssize_t end) {
             route::UpdateScopesSeenWithStartScopeLogical(self, item.get(), scope.get(), false);
         py::Ref newIndex = py::check(PyInt_FromSsize_t(counted));
         if (py::checkStatus(PyObject_RichCompareBool(newIndex.get(), oldIndex.get(), Py_EQ))) continue;
-
-        py::Ref newLocal = appendScopeSuffixes(bare.get(), newIndex.get());
-        route::SetLogicalScopeNames(self, item.get(), j, scope.get(), newLocal.get());
-        route::LogicalInScopeChanged(self, item.get(), scope.get());
-        const bool hadIndex = PyInt_AsLong(oldIndex.get()) != -1 || PyErr_Occurred();
-        if (PyErr_Occurred()) py::fail();
-        assertThat(hadIndex);
-        if (!hadIndex) continue;
-        py::Ref oldFull = joinTwoScopeNames(scope.get(), local.get());
-        addChange(item->fKind == kClassLogical ? s.classChanges : s.functionChanges, oldFull.get());
-        py::Ref newFull = joinTwoScopeNames(scope.get(), newLocal.get());
-        // The renamed body may reach past `end`: rename all of it now, or
-        // the lines beyond keep the old index (nothing walks this
-        // definition again in this call).
-        route::PropagateScopeIndexChangeForward(self, oldFull.get(), newFull.get(), j + 1,
-                                                logicalListLength(self));
+        const long old = PyInt_AsLong(oldIndex.get());
+        const int hadIndex = old == -1 && PyErr_Occurred() ? (PyErr_Clear(), -1) : old != -1;
+        repairDefinition(self, item, j, scope.get(), local.get(), bare.get(), hadIndex, counted);
     }
     s.endIndexForScopesSeen = end;
 }
@@ -153,6 +234,7 @@ void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName, Py
         // Old names too: the scopes nested here had other full names before.
         PyObject* leaf = isScopeStart(item.record()) ? localScopeDefined(item.record()) : nullptr;
         py::Ref oldLeaf = py::Ref::own(leaf ? leaf : Py_None);
+        if (leaf != nullptr) fileDefinition(self, item.get(), j);
         route::LogicalInScopeChanged(self, item.get(), renamed.get(), name.get(), oldLeaf.get());
     }
 }

@@ -57,6 +57,7 @@ using Slots = DestroyableSubclass<FinderState, &gFinderStateOffset>;
 int finder_init(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guardedStatus([&] {
         setLogicalList(self, initDestroyableSubclass(self, args, kwargs).get());
+        dropDefinitionIndex(self);
         route::Clear(self);
         return 0;
     });
@@ -72,18 +73,23 @@ PyGetSetDef finder_getset[] = {
 };
 
 // --- Python-visible methods -------------------------------------------------
+// A step called directly from Python may store any names: the definition
+// index cannot follow, and is rebuilt at the next call that needs it.
 
 PyObject* none() { return py::Ref::none().release(); }
 
 PyObject* m_destroy_impl(PyObject* self, PyObject* const*) {
+    dropDefinitionIndex(self);
     finder::DestroyImpl(self);
     return none();
 }
 PyObject* m_Clear(PyObject* self, PyObject* const*) {
+    dropDefinitionIndex(self);
     finder::Clear(self);
     return none();
 }
 PyObject* m_PrepareForFind(PyObject* self, PyObject* const*) {
+    dropDefinitionIndex(self);
     finder::PrepareForFind(self);
     return none();
 }
@@ -91,30 +97,37 @@ PyObject* m_FindChanges(PyObject* self, PyObject* const* a) {
     return finder::FindChanges(self, a[0], a[1]).release();
 }
 PyObject* m_FindChangesEntireListAdded(PyObject* self, PyObject* const*) {
+    dropDefinitionIndex(self);
     finder::FindChangesEntireListAdded(self);
     return none();
 }
 PyObject* m_GetLeafScopeWithIndex(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     return finder::GetLeafScopeWithIndex(self, a[0], py::asIndex(a[1])).release();
 }
 PyObject* m_ProcessRemovedLogicals(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     return finder::ProcessRemovedLogicals(self, a[0]).release();
 }
 PyObject* m_ProcessAddedLogicals(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     finder::ProcessAddedLogicals(self, a[0], a[1]);
     return none();
 }
 PyObject* m_ProcessDedentedComments(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     const Py_ssize_t first = py::asIndex(a[0]);
     const Py_ssize_t end = route::builtin<Step::ProcessDedentedComments>(finder::ProcessDedentedComments,
                                                                          self, first);
     return py::check(PyInt_FromSsize_t(end)).release();
 }
 PyObject* m_LogicalInScopeChanged(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     finder::LogicalInScopeChanged(self, a[0], a[1], a[2] ? a[2] : Py_None, a[3] ? a[3] : Py_None);
     return none();
 }
 PyObject* m_SetLogicalScopeNames(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     py::Ref scope, local;
     unpackPair(a[2], &scope, &local);
     const bool changed =
@@ -122,25 +135,30 @@ PyObject* m_SetLogicalScopeNames(PyObject* self, PyObject* const* a) {
     return py::Ref::own(changed ? Py_True : Py_False).release();
 }
 PyObject* m_UpdateLogicalScopeName(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     return finder::UpdateLogicalScopeName(self, a[0], py::asIndex(a[1]), a[2]).release();
 }
 PyObject* m_UpdateContainingScope(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     finder::UpdateContainingScope(self, a[0], py::asIndex(a[1]), a[2]);
     return none();
 }
 PyObject* m_PropagateScopeIndexChangeForward(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     const Py_ssize_t start = py::asIndex(a[2]);
     const Py_ssize_t end = py::asIndex(a[3]);
     finder::PropagateScopeIndexChangeForward(self, a[0], a[1], start, end);
     return none();
 }
 PyObject* m_FindScopeIndexForLogical(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     const Py_ssize_t i = py::asIndex(a[1]);
     const Py_ssize_t index = route::builtin<Step::FindScopeIndexForLogical>(
         finder::FindScopeIndexForLogical, self, a[0], i);
     return py::check(PyInt_FromSsize_t(index)).release();
 }
 PyObject* m_FindScopeNameContainingLogical(PyObject* self, PyObject* const* a) {
+    dropDefinitionIndex(self);
     return finder::FindScopeNameContainingLogical(self, py::asIndex(a[0])).release();
 }
 

@@ -44,8 +44,7 @@ void FindChangesEntireListAdded(PyObject* self) {
         if (scopeStart) {
             // Counted by bare name: a list read before carries indexed
             // names, which must not count as names of their own.
-            const Py_ssize_t index =
-                route::UpdateScopesSeenWithStartScopeLogical(self, logical.get(), topName, false);
+            const Py_ssize_t index = CountDefinition(self, logical.get(), i, topName);
             local = route::GetLeafScopeWithIndex(self, logical.get(), index);
         }
         py::Ref top = stack.back().name.copy();

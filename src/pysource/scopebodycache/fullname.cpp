@@ -39,7 +39,12 @@ py::Ref getFullNameForScopeDef(PyObject* scopeDef) {
     return joinTwoScopeNames(scope.get(), name.get());
 }
 
-py::Ref callGetFullNameForScopeDef(PyObject* scopeDef) {
+bool fullNameFunctionCurrent() noexcept {
+    return PyDict_GetItem(gModuleDict, gNames.GetFullNameForScopeDef) == gFullNameFunction;
+}
+
+py::Ref callGetFullNameForScopeDef(PyObject* scopeDef, bool native) {
+    if (native) return getFullNameForScopeDef(scopeDef);
     PyObject* f = lookupGlobal(gNames.GetFullNameForScopeDef);
     if (f == gFullNameFunction) return getFullNameForScopeDef(scopeDef);
     py::Ref keep = py::Ref::own(f);

@@ -8,8 +8,12 @@ namespace sbc {
 
 py::Ref getFullNameForScopeDef(PyObject* scopeDef);
 
-// Calls whatever the module global GetFullNameForScopeDef holds now.
-py::Ref callGetFullNameForScopeDef(PyObject* scopeDef);
+// Calls whatever the module global GetFullNameForScopeDef holds now; with
+// `native` (the caller has checked fullNameFunctionCurrent), our own.
+py::Ref callGetFullNameForScopeDef(PyObject* scopeDef, bool native = false);
+
+// Whether the module global GetFullNameForScopeDef is still our own function.
+bool fullNameFunctionCurrent() noexcept;
 
 // Binds GetFullNameForScopeDef in the module namespace.
 void bindModuleFunctions(PyObject* moduleDict);

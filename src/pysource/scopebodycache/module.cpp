@@ -13,6 +13,8 @@
 
 #include <frameobject.h>
 
+#include <cstdlib>
+
 namespace sbc {
 namespace {
 
@@ -71,6 +73,7 @@ void moduleBody(PyObject* dict) {
     }
     py::Ref symbolinfoRef = py::Ref::steal(symbolinfo);
     py::checkStatus(PyDict_SetItemString(dict, "symbolinfo", symbolinfo));
+    bindNativeSiblings(fastaccess.get(), symbolinfo);
 
     bindScopeBodyCacheMethods();
     bindChangeFinderMethods();
@@ -90,6 +93,8 @@ void initialize() {
 
     internNames();
     internStepNames();
+    const char* check = std::getenv("SBC_CHECK_INDEX");
+    gCheckDefinitionIndex = check != nullptr && check[0] == '1';
     readyFunctionType();
     checkBuiltinNames();
 

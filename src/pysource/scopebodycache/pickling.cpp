@@ -44,6 +44,7 @@ struct PickledClass {
     long checksum;
     const char* checksumMessage;  // one %zd: the checksum found in the pickle
     PyObject* Names::*rebuildName;
+    void (*stateApplied)(PyObject* self) noexcept;  // internal state to reset
     int fieldCount;
     Field fields[kMaxFields];
 };
@@ -79,6 +80,7 @@ const PickledClass kChangeFinder = {
     0x093a2af,
     "Incompatible checksums (%zd vs 0x093a2af = (" SBC_BASE_FIELD_NAMES SBC_FINDER_FIELDS(SBC_FIELD_NAME_LIST) "))",
     &Names::unpickleChangeFinder,
+    dropDefinitionIndex,  // rebuilt from the list when needed
     2 + 0 SBC_FINDER_FIELDS(SBC_COUNT_FIELD),
     {SBC_BASE_FIELDS SBC_FINDER_FIELDS(SBC_FINDER_FIELD)},
 };
@@ -89,6 +91,7 @@ const PickledClass kScopeBodyCache = {
     0xa66c71f,
     "Incompatible checksums (%zd vs 0xa66c71f = (" SBC_BASE_FIELD_NAMES SBC_BODY_CACHE_FIELDS(SBC_FIELD_NAME_LIST) "))",
     &Names::unpickleScopeBodyCache,
+    [](PyObject*) noexcept {},
     2 + 0 SBC_BODY_CACHE_FIELDS(SBC_COUNT_FIELD),
     {SBC_BASE_FIELDS SBC_BODY_CACHE_FIELDS(SBC_BODY_CACHE_FIELD)},
 };
@@ -156,6 +159,8 @@ py::Ref reduce(const PickledClass& c, PyObject* self) {
 // Fields are assigned one at a time as they are read: a failure part way
 // leaves the earlier ones assigned.
 void applyState(const PickledClass& c, PyObject* self, PyObject* state) {
+    // Whatever the state holds, internal state built for the old one goes.
+    c.stateApplied(self);
     if (state == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
     py::Ref keep = py::Ref::own(state);
     const Py_ssize_t size = PyTuple_GET_SIZE(state);

@@ -51,10 +51,19 @@ auto builtin(B (*step)(PyObject*, Params...), PyObject* self, Args... args) {
 }
 
 // Calls step S on `self`: the override when there is one, else the
-// built-in. R is what the pass uses of the result.
+// built-in. R is what the pass uses of the result. The native pass runs
+// only where nothing is overridden, so it calls the built-in directly.
 template <Step S, class R, class B, class... Params, class... Args>
 R call(B (*step)(PyObject*, Params...), PyObject* self, Args... args) {
     auto run = [&]() -> R {
+        if (nativePass(self)) {
+            if constexpr (std::is_void_v<R>) {
+                step(self, args...);
+                return;
+            } else {
+                return step(self, args...);
+            }
+        }
         if (py::Ref override = findOverride(self, S)) {
             return fromOverride<R>(callStepOverride<S>(override, args...));
         }

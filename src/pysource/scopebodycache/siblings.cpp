@@ -87,6 +87,25 @@ void* entryPoint(const char* moduleName, const char* name, const char* signature
     return p;
 }
 
+// An optional entry: its pointer, or nullptr when the table lacks it or
+// declares another signature.
+void* optionalEntry(PyObject* module, const char* name, const char* signature) {
+    py::Ref table = py::Ref::steal(PyObject_GetAttrString(module, contracts::kCapiAttr));
+    if (!table || !PyDict_Check(table.get())) {
+        PyErr_Clear();
+        return nullptr;
+    }
+    PyObject* capsule = PyDict_GetItemString(table.get(), name);
+    if (capsule == nullptr || !PyCapsule_IsValid(capsule, signature)) return nullptr;
+    return PyCapsule_GetPointer(capsule, signature);
+}
+
+// module.<name> as found in the module's own dict (borrowed, may be null).
+PyObject* moduleAttribute(PyObject* module, PyObject* name) {
+    if (!PyModule_Check(module)) return nullptr;
+    return PyDict_GetItem(PyModule_GetDict(module), name);
+}
+
 PyObject* objectVariable(const char* moduleName, const char* name) {
     return *static_cast<PyObject**>(entryPoint(moduleName, name, contracts::sig::kObject, false));
 }
@@ -169,6 +188,42 @@ void bindFunctions() {
         entryPoint(kSymbolinfo, "AppendScopeSuffixes", sig::kAppendSuffixes, true));
 }
 
+NativeSiblings gNative;
+
+void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo) {
+    using namespace contracts;
+    NativeSiblings n;
+    n.indexForLineno = reinterpret_cast<IndexForLinenoFn>(
+        optionalEntry(fastaccess, "IndexForLineno", sig::kIndexForLineno));
+    n.findIndexOfLogical = reinterpret_cast<FindIndexOfLogicalFn>(
+        optionalEntry(fastaccess, "FindIndexOfLogical", sig::kFindIndexOfLogical));
+    n.leafScopeNameHasIndex = reinterpret_cast<LeafScopeNameHasIndexFn>(
+        optionalEntry(symbolinfo, "LeafScopeNameHasIndex", sig::kLeafScopeNameHasIndex));
+    n.scopeNameSuffix = reinterpret_cast<ScopeNameSuffixFn>(
+        optionalEntry(symbolinfo, "ScopeNameSuffix", sig::kScopeNameSuffix));
+    n.fastaccess = py::Ref::own(fastaccess).release();
+    n.symbolinfo = py::Ref::own(symbolinfo).release();
+    n.indexForLinenoFunction = py::Ref::own(moduleAttribute(fastaccess, gNames.IndexForLineno)).release();
+    n.findIndexOfLogicalFunction =
+        py::Ref::own(moduleAttribute(fastaccess, gNames.FindIndexOfLogical)).release();
+    n.leafScopeNameHasIndexFunction =
+        py::Ref::own(moduleAttribute(symbolinfo, gNames.LeafScopeNameHasIndex)).release();
+    gNative = n;
+}
+
+bool nativeSiblingsCurrent() noexcept {
+    const NativeSiblings& n = gNative;
+    if (!n.indexForLineno || !n.findIndexOfLogical || !n.leafScopeNameHasIndex || !n.scopeNameSuffix ||
+        !n.indexForLinenoFunction || !n.findIndexOfLogicalFunction || !n.leafScopeNameHasIndexFunction) {
+        return false;
+    }
+    return PyDict_GetItem(gModuleDict, gNames.fastaccess) == n.fastaccess &&
+           PyDict_GetItem(gModuleDict, gNames.symbolinfo) == n.symbolinfo &&
+           moduleAttribute(n.fastaccess, gNames.IndexForLineno) == n.indexForLinenoFunction &&
+           moduleAttribute(n.fastaccess, gNames.FindIndexOfLogical) == n.findIndexOfLogicalFunction &&
+           moduleAttribute(n.symbolinfo, gNames.LeafScopeNameHasIndex) == n.leafScopeNameHasIndexFunction;
+}
+
 PyObject* lookupGlobal(PyObject* name) {
     PyObject* v = PyDict_GetItem(gModuleDict, name);
     if (v == nullptr) v = PyDict_GetItem(PyEval_GetBuiltins(), name);
@@ -201,20 +256,31 @@ py::Ref siblingFunction(PyObject* moduleGlobal, PyObject* attribute) {
 }
 }  // namespace
 
-Py_ssize_t indexForLineno(PyObject* logicalList, long lineno) {
+Py_ssize_t indexForLineno(PyObject* logicalList, long lineno, bool native) {
+    if (native) {
+        const Py_ssize_t i = gNative.indexForLineno(logicalList, lineno);
+        if (i == -1 && PyErr_Occurred()) py::fail();
+        return i;
+    }
     py::Ref fn = siblingFunction(gNames.fastaccess, gNames.IndexForLineno);
     py::Ref line = py::check(PyInt_FromLong(lineno));
     py::Ref r = py::check(PyObject_CallFunctionObjArgs(fn.get(), logicalList, line.get(), nullptr));
     return py::asIndex(r.get());
 }
 
-Py_ssize_t findIndexOfLogical(PyObject* logicalList, PyObject* logical) {
+Py_ssize_t findIndexOfLogical(PyObject* logicalList, PyObject* logical, bool native) {
+    if (native) {
+        const Py_ssize_t i = gNative.findIndexOfLogical(logicalList, logical);
+        if (i == -1 && PyErr_Occurred()) py::fail();
+        return i;
+    }
     py::Ref fn = siblingFunction(gNames.fastaccess, gNames.FindIndexOfLogical);
     py::Ref r = py::check(PyObject_CallFunctionObjArgs(fn.get(), logicalList, logical, nullptr));
     return py::asIndex(r.get());
 }
 
-bool leafScopeNameHasIndex(PyObject* name) {
+bool leafScopeNameHasIndex(PyObject* name, bool native) {
+    if (native) return gNative.leafScopeNameHasIndex(name) != 0;
     py::Ref fn = siblingFunction(gNames.symbolinfo, gNames.LeafScopeNameHasIndex);
     py::Ref r = py::check(PyObject_CallFunctionObjArgs(fn.get(), name, nullptr));
     return py::truth(r.get());

@@ -40,10 +40,37 @@ py::Ref splitScopeNames(PyObject* full);
 py::Ref splitScopeNameFromSuffixes(PyObject* name);
 py::Ref appendScopeSuffixes(PyObject* name, PyObject* index);
 
+// The native forms of the siblings' Python-level functions, when the
+// siblings publish them, and what the module globals held at import.
+struct NativeSiblings {
+    contracts::IndexForLinenoFn indexForLineno = nullptr;
+    contracts::FindIndexOfLogicalFn findIndexOfLogical = nullptr;
+    contracts::LeafScopeNameHasIndexFn leafScopeNameHasIndex = nullptr;
+    contracts::ScopeNameSuffixFn scopeNameSuffix = nullptr;
+    PyObject* fastaccess = nullptr;  // the modules bound as globals at import
+    PyObject* symbolinfo = nullptr;
+    PyObject* indexForLinenoFunction = nullptr;  // their functions then
+    PyObject* findIndexOfLogicalFunction = nullptr;
+    PyObject* leafScopeNameHasIndexFunction = nullptr;
+};
+
+extern NativeSiblings gNative;
+
+// Takes the native forms and notes the modules and functions they stand
+// for; once, when the module body has bound its globals.
+void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo);
+
+// Whether each by-name lookup of a sibling function would find what was
+// bound at import, and its native form exists: calling the native form is
+// then the same as the lookup and call. Runs no Python code.
+bool nativeSiblingsCurrent() noexcept;
+
 // Calls of the siblings' Python-level functions, looked up by name through
-// the module globals `_fastaccess` and `symbolinfo` at each call.
-Py_ssize_t indexForLineno(PyObject* logicalList, long lineno);
-Py_ssize_t findIndexOfLogical(PyObject* logicalList, PyObject* logical);
-bool leafScopeNameHasIndex(PyObject* name);
+// the module globals `_fastaccess` and `symbolinfo` at each call; with
+// `native` (the caller has checked nativeSiblingsCurrent), their native
+// forms.
+Py_ssize_t indexForLineno(PyObject* logicalList, long lineno, bool native = false);
+Py_ssize_t findIndexOfLogical(PyObject* logicalList, PyObject* logical, bool native = false);
+bool leafScopeNameHasIndex(PyObject* name, bool native = false);
 
 }  // namespace sbc

@@ -354,6 +354,29 @@ Py_ssize_t findIndex(PyObject* list, PyObject* target) {
     return linearFind(list, target);
 }
 
+void requireList(PyObject* o, const char* function);
+
+// The native forms published in _capi: the same lookups and errors as the
+// Python functions below, without building argument tuples.
+Py_ssize_t nativeIndexForLineno(PyObject* list, long lineno) noexcept {
+    return py::guardedAs<Py_ssize_t>(-1, [&] {
+        requireList(list, "IndexForLineno");
+        const Py_ssize_t i = lowerBound(list, lineno);
+        if (i == kNotLogical) {
+            PyErr_SetString(PyExc_TypeError, "Argument must be a logical");
+            py::fail();
+        }
+        return i;
+    });
+}
+
+Py_ssize_t nativeFindIndexOfLogical(PyObject* list, PyObject* logical) noexcept {
+    return py::guardedAs<Py_ssize_t>(-1, [&] {
+        requireList(list, "FindIndexOfLogical");
+        return findIndex(list, logical);
+    });
+}
+
 void requireList(PyObject* o, const char* function) {
     if (!PyList_Check(o)) {
         PyErr_Format(PyExc_TypeError, "%s() argument 1 must be list, not %.200s", function,
@@ -435,6 +458,12 @@ void init() {
     PyObject* capi = siblings::makeCapi(module);
     siblings::publish(capi, "LogicalLineType", &gLogicalLineTypeVar, contracts::sig::kObject);
     siblings::publish(capi, "__TimeFunc", &gTimeFunc, contracts::sig::kObject);
+    contracts::IndexForLinenoFn indexForLineno = nativeIndexForLineno;
+    contracts::FindIndexOfLogicalFn findIndexOfLogical = nativeFindIndexOfLogical;
+    siblings::publish(capi, "IndexForLineno", reinterpret_cast<void*>(indexForLineno),
+                      contracts::sig::kIndexForLineno);
+    siblings::publish(capi, "FindIndexOfLogical", reinterpret_cast<void*>(findIndexOfLogical),
+                      contracts::sig::kFindIndexOfLogical);
 }
 
 }  // namespace fastaccess

@@ -11,7 +11,6 @@
 #include "pysource/contracts/capi.hpp"
 #include "siblings/sibling_util.hpp"
 
-#include <cstdio>
 #include <cstring>
 #include <string>
 #include <string_view>
@@ -247,8 +246,18 @@ PyObject* AppendScopeSuffixes(PyObject* name, PyObject* index, PyObject* extra,
         py::Ref longText;  // keeps a long's digits alive
         std::string_view indexText;
         if (PyInt_Check(index)) {
-            int n = std::snprintf(digits, sizeof digits, "%ld", PyInt_AS_LONG(index));
-            indexText = std::string_view(digits, static_cast<size_t>(n));
+            // Runs once per definition named: formatted by hand.
+            const long value = PyInt_AS_LONG(index);
+            unsigned long magnitude = value < 0 ? 0UL - static_cast<unsigned long>(value)
+                                                : static_cast<unsigned long>(value);
+            char* end = digits + sizeof digits;
+            char* p = end;
+            do {
+                *--p = static_cast<char>('0' + magnitude % 10);
+                magnitude /= 10;
+            } while (magnitude != 0);
+            if (value < 0) *--p = '-';
+            indexText = std::string_view(p, static_cast<size_t>(end - p));
         } else if (PyLong_Check(index)) {
             longText = py::check(PyObject_Str(index));
             indexText = view(longText.get());
@@ -290,9 +299,29 @@ PyObject* pyAppendScopeSuffixes(PyObject*, PyObject* args) {
     return AppendScopeSuffixes(name, index, extra, 0);
 }
 
+int nativeLeafScopeNameHasIndex(PyObject* name) noexcept {
+    return PyString_Check(name) && suffixLength(view(name)) != 0;
+}
+
 PyObject* LeafScopeNameHasIndex(PyObject*, PyObject* name) {
-    bool has = PyString_Check(name) && suffixLength(view(name)) != 0;
-    return py::Ref::own(has ? Py_True : Py_False).release();
+    return py::Ref::own(nativeLeafScopeNameHasIndex(name) ? Py_True : Py_False).release();
+}
+
+Py_ssize_t nativeScopeNameSuffix(PyObject* name, Py_ssize_t* bareLength) noexcept {
+    if (!PyString_Check(name)) {
+        *bareLength = 0;
+        return -1;
+    }
+    const std::string_view text = view(name);
+    const size_t suffix = suffixLength(text);
+    *bareLength = static_cast<Py_ssize_t>(text.size() - suffix);
+    if (suffix == 0) return -1;
+    Py_ssize_t index = 0;
+    for (char c : text.substr(text.size() - suffix + 1)) {
+        if (index > (PY_SSIZE_T_MAX - 9) / 10) return kSuffixTooLarge;
+        index = index * 10 + (c - '0');
+    }
+    return index;
 }
 
 PyMethodDef gModuleMethods[] = {
@@ -332,6 +361,11 @@ void publishFunctions(PyObject* capi) {
                       sig::kSplitOne);
     siblings::publish(capi, "AppendScopeSuffixes", reinterpret_cast<void*>(append),
                       sig::kAppendSuffixes);
+    LeafScopeNameHasIndexFn hasIndex = nativeLeafScopeNameHasIndex;
+    ScopeNameSuffixFn suffix = nativeScopeNameSuffix;
+    siblings::publish(capi, "LeafScopeNameHasIndex", reinterpret_cast<void*>(hasIndex),
+                      sig::kLeafScopeNameHasIndex);
+    siblings::publish(capi, "ScopeNameSuffix", reinterpret_cast<void*>(suffix), sig::kScopeNameSuffix);
 }
 
 void init() {

@@ -1,0 +1,314 @@
+#include "pysource/scopebodycache/def_index.hpp"
+
+#include "pysource/contracts/accessors.hpp"
+#include "pysource/scopebodycache/siblings.hpp"
+
+#include <algorithm>
+#include <cstring>
+
+namespace sbc {
+
+using namespace contracts;
+
+namespace {
+
+bool sameStr(PyObject* a, PyObject* b) noexcept {
+    return a == b || (PyString_GET_SIZE(a) == PyString_GET_SIZE(b) &&
+                      std::memcmp(PyString_AS_STRING(a), PyString_AS_STRING(b), PyString_GET_SIZE(a)) == 0);
+}
+
+bool sameBytes(PyObject* s, std::string_view bytes) noexcept {
+    return static_cast<size_t>(PyString_GET_SIZE(s)) == bytes.size() &&
+           std::memcmp(PyString_AS_STRING(s), bytes.data(), bytes.size()) == 0;
+}
+
+struct LaterFirst {
+    bool operator()(const DefIndex::Candidate& a, const DefIndex::Candidate& b) const noexcept {
+        return a.at > b.at;
+    }
+};
+
+}  // namespace
+
+bool readDefinedName(PyObject* logical, DefinedName* out) {
+    PyObject* name = localScopeDefined(asLogical(logical));
+    if (name == nullptr) return false;
+    out->name = name;
+    out->index = gNative.scopeNameSuffix(name, &out->bareLength);
+    return true;
+}
+
+py::Ref bareNameOf(PyObject* logical, const DefinedName& name) {
+    if (name.bareLength == PyString_GET_SIZE(name.name)) return py::Ref::own(name.name);
+    PyObject* token = definedToken(asLogical(logical));
+    if (token != nullptr && PyString_CheckExact(token) && sameBytes(token, name.bare())) return py::Ref::own(token);
+    return py::check(PyString_FromStringAndSize(PyString_AS_STRING(name.name), name.bareLength));
+}
+
+DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(64, nullptr) {}
+
+DefIndex::~DefIndex() {
+    clear();
+    flushReleases();
+}
+
+void DefIndex::clear() {
+    for (Group*& g : slots_) {
+        if (g == nullptr) continue;
+        for (Member& m : g->members) released_.push_back(m.def);
+        delete g;
+        g = nullptr;
+    }
+    used_ = 0;
+    groupOf_.clear();
+    for (Candidate& c : candidates_) released_.push_back(c.def.release());
+    candidates_.clear();
+}
+
+void DefIndex::flushReleases() noexcept {
+    std::vector<PyObject*> pending;
+    pending.swap(released_);
+    for (PyObject* o : pending) Py_DECREF(o);
+}
+
+size_t DefIndex::hashOf(PyObject* scope, std::string_view bare) {
+    // A str caches its hash, so the scope part costs nothing after the
+    // first time; bare names are short.
+    size_t h = static_cast<size_t>(PyObject_Hash(scope)) * 0x9E3779B97F4A7C15ull;
+    for (char c : bare) h = (h ^ static_cast<unsigned char>(c)) * 0x100000001B3ull;
+    return h;
+}
+
+DefIndex::Group* DefIndex::find(PyObject* scope, std::string_view bare, size_t hash) const {
+    const size_t mask = slots_.size() - 1;
+    for (size_t i = hash & mask;; i = (i + 1) & mask) {
+        Group* g = slots_[i];
+        if (g == nullptr) return nullptr;
+        if (g->hash == hash && sameStr(g->scope.get(), scope) && sameBytes(g->bare.get(), bare)) return g;
+    }
+}
+
+void DefIndex::grow() {
+    std::vector<Group*> old(slots_.size() * 2, nullptr);
+    old.swap(slots_);
+    const size_t mask = slots_.size() - 1;
+    for (Group* g : old) {
+        if (g == nullptr) continue;
+        size_t i = g->hash & mask;
+        while (slots_[i] != nullptr) i = (i + 1) & mask;
+        slots_[i] = g;
+    }
+}
+
+DefIndex::Group& DefIndex::findOrAdd(PyObject* def, PyObject* scope, const DefinedName& name, size_t hash) {
+    if (Group* g = find(scope, name.bare(), hash)) return *g;
+    if ((used_ + 1) * 2 > slots_.size()) grow();
+    auto g = std::make_unique<Group>();
+    g->scope = py::Ref::own(scope);
+    g->bare = bareNameOf(def, name);
+    g->hash = hash;
+    const size_t mask = slots_.size() - 1;
+    size_t i = hash & mask;
+    while (slots_[i] != nullptr) i = (i + 1) & mask;
+    slots_[i] = g.release();
+    ++used_;
+    return *slots_[i];
+}
+
+void DefIndex::erase(Group* group) {
+    // Backward-shift deletion keeps every probe chain unbroken.
+    const size_t mask = slots_.size() - 1;
+    size_t i = group->hash & mask;
+    while (slots_[i] != group) i = (i + 1) & mask;
+    slots_[i] = nullptr;
+    for (size_t j = (i + 1) & mask; slots_[j] != nullptr; j = (j + 1) & mask) {
+        const size_t home = slots_[j]->hash & mask;
+        const bool stays = i <= j ? (i < home && home <= j) : (i < home || home <= j);
+        if (stays) continue;
+        slots_[i] = slots_[j];
+        slots_[j] = nullptr;
+        i = j;
+    }
+    --used_;
+    delete group;
+}
+
+Py_ssize_t DefIndex::indexOf(Member& member) {
+    PyObject* list = list_.get();
+    if (member.at >= 0 && member.at < PyList_GET_SIZE(list) && PyList_GET_ITEM(list, member.at) == member.def) {
+        return member.at;
+    }
+    const Py_ssize_t found = gNative.findIndexOfLogical(list, member.def);
+    if (found < 0) {
+        PyErr_Clear();
+        return -1;
+    }
+    member.at = found;
+    return found;
+}
+
+Py_ssize_t DefIndex::lowerBound(Group& group, Py_ssize_t at) {
+    size_t lo = 0;
+    size_t hi = group.members.size();
+    while (lo < hi) {
+        const size_t mid = lo + (hi - lo) / 2;
+        const Py_ssize_t i = indexOf(group.members[mid]);
+        if (i < 0) return -1;
+        if (i < at) {
+            lo = mid + 1;
+        } else {
+            hi = mid;
+        }
+    }
+    return static_cast<Py_ssize_t>(lo);
+}
+
+void DefIndex::queueFrom(Group& group, size_t position) {
+    for (size_t k = position; k < group.members.size(); ++k) {
+        Member& m = group.members[k];
+        const Py_ssize_t at = indexOf(m);
+        if (at < 0) continue;  // found missing when popped, through positionOf
+        candidates_.push_back({at, py::Ref::own(m.def)});
+        std::push_heap(candidates_.begin(), candidates_.end(), LaterFirst());
+    }
+}
+
+Py_ssize_t DefIndex::append(PyObject* def, Py_ssize_t at, PyObject* scope, const DefinedName& name) {
+    if (groupOf_.count(def) != 0) remove(def);
+    Group& group = findOrAdd(def, scope, name, hashOf(scope, name.bare()));
+    Py_INCREF(def);
+    group.members.push_back({def, at});
+    groupOf_[def] = &group;
+    return static_cast<Py_ssize_t>(group.members.size()) - 1;
+}
+
+bool DefIndex::rebuild() {
+    clear();
+    PyObject* list = list_.get();
+    for (Py_ssize_t j = 0; j < PyList_GET_SIZE(list); ++j) {
+        PyObject* item = PyList_GET_ITEM(list, j);
+        if (!logicalCheck(item)) return false;  // the table walk says where
+        if (!isScopeStart(asLogical(item))) continue;
+        PyObject* scope = scopeName(asLogical(item));
+        DefinedName name;
+        // Not named yet (added in this call): filed when it is visited.
+        if (scope == Py_None || !readDefinedName(item, &name)) continue;
+        if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return false;
+        append(item, j, scope, name);
+    }
+    // A stored index that is not the position is repaired when the pass
+    // comes to it, as the table walk would.
+    for (Group* g : slots_) {
+        if (g == nullptr) continue;
+        for (size_t k = 0; k < g->members.size(); ++k) {
+            DefinedName name;
+            readDefinedName(g->members[k].def, &name);
+            if (name.index != static_cast<Py_ssize_t>(k)) {
+                queueFrom(*g, k);
+                break;
+            }
+        }
+    }
+    return true;
+}
+
+void DefIndex::remove(PyObject* def) {
+    auto it = groupOf_.find(def);
+    if (it == groupOf_.end()) return;
+    Group* group = it->second;
+    groupOf_.erase(it);
+    auto& members = group->members;
+    const auto pos = std::find_if(members.begin(), members.end(), [&](const Member& m) { return m.def == def; });
+    const size_t position = static_cast<size_t>(pos - members.begin());
+    members.erase(pos);
+    released_.push_back(def);
+    if (members.empty()) {
+        erase(group);
+    } else {
+        queueFrom(*group, position);
+    }
+}
+
+bool DefIndex::place(PyObject* def, Py_ssize_t at) {
+    remove(def);
+    PyObject* scope = scopeName(asLogical(def));
+    DefinedName name;
+    if (scope == Py_None || !readDefinedName(def, &name)) return true;
+    if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return false;
+    Group& group = findOrAdd(def, scope, name, hashOf(scope, name.bare()));
+    const Py_ssize_t position = lowerBound(group, at);
+    if (position < 0) return false;
+    Py_INCREF(def);
+    group.members.insert(group.members.begin() + position, Member{def, at});
+    groupOf_[def] = &group;
+    queueFrom(group, static_cast<size_t>(position));
+    return true;
+}
+
+Py_ssize_t DefIndex::countBefore(PyObject* scope, const DefinedName& name, Py_ssize_t at) {
+    if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return -1;
+    Group* group = find(scope, name.bare(), hashOf(scope, name.bare()));
+    return group == nullptr ? 0 : lowerBound(*group, at);
+}
+
+Py_ssize_t DefIndex::positionOf(PyObject* def) {
+    auto it = groupOf_.find(def);
+    if (it == groupOf_.end()) return -1;
+    auto& members = it->second->members;
+    for (size_t k = 0; k < members.size(); ++k) {
+        if (members[k].def == def) return indexOf(members[k]) < 0 ? -1 : static_cast<Py_ssize_t>(k);
+    }
+    return -1;
+}
+
+bool DefIndex::popCandidate(Py_ssize_t end, Candidate* out) {
+    if (candidates_.empty() || candidates_.front().at >= end) return false;
+    std::pop_heap(candidates_.begin(), candidates_.end(), LaterFirst());
+    *out = std::move(candidates_.back());
+    candidates_.pop_back();
+    return true;
+}
+
+int DefIndex::traverse(visitproc visit, void* arg) const {
+    Py_VISIT(list_.get());
+    for (const auto& entry : groupOf_) Py_VISIT(entry.first);
+    for (const Candidate& c : candidates_) Py_VISIT(c.def.get());
+    for (PyObject* o : released_) Py_VISIT(o);
+    return 0;
+}
+
+bool DefIndex::matchesList(std::string* why) {
+    DefIndex fresh(list_.get());
+    if (!fresh.rebuild()) {
+        *why = "the list holds names that cannot be indexed";
+        return false;
+    }
+    if (fresh.groupOf_.size() != groupOf_.size()) {
+        *why = "the index holds " + std::to_string(groupOf_.size()) + " definitions, the list " +
+               std::to_string(fresh.groupOf_.size());
+        return false;
+    }
+    for (Group* g : fresh.slots_) {
+        if (g == nullptr) continue;
+        Group* mine = find(g->scope.get(), {PyString_AS_STRING(g->bare.get()),
+                                            static_cast<size_t>(PyString_GET_SIZE(g->bare.get()))},
+                           g->hash);
+        const std::string key = std::string(PyString_AS_STRING(g->scope.get())) + " / " +
+                                PyString_AS_STRING(g->bare.get());
+        if (mine == nullptr || mine->members.size() != g->members.size()) {
+            *why = "the group " + key + " differs";
+            return false;
+        }
+        for (size_t k = 0; k < g->members.size(); ++k) {
+            DefinedName name;
+            readDefinedName(g->members[k].def, &name);
+            if (mine->members[k].def != g->members[k].def || name.index != static_cast<Py_ssize_t>(k)) {
+                *why = "member " + std::to_string(k) + " of " + key + " differs";
+                return false;
+            }
+        }
+    }
+    return true;
+}
+
+}  // namespace sbc

@@ -1,0 +1,138 @@
+// The definition index: the class/def logicals of one logical list, grouped
+// by definition key (containing scope name, defined name without its scope
+// index), each group in list order. A definition's scope index is its
+// position in its group.
+//
+// It is what the scopes-seen table is for the whole list, kept from one
+// FindChanges call to the next: the whole-list pass builds it, the
+// incremental pass keeps it in step with every name it stores, and adding
+// or removing a definition then renumbers only the later definitions of the
+// same key (queued as candidates, repaired in list order) instead of
+// recounting the list from the top. It mirrors the names stored in the
+// logicals and nothing else, so it can always be rebuilt from them.
+//
+// Only the finder's native pass uses it; it is never pickled. It is
+// dropped whenever it cannot be shown to match the list (see finder.hpp).
+#pragma once
+
+#include "common/pyref.hpp"
+
+#include <memory>
+#include <string_view>
+#include <unordered_map>
+#include <vector>
+
+namespace sbc {
+
+// A defined name as the symbol-info component reads it: the name object,
+// the length of its part without a scope index, and the index (-1: none;
+// contracts::kSuffixTooLarge: one no count can reach).
+struct DefinedName {
+    PyObject* name = nullptr;  // borrowed
+    Py_ssize_t bareLength = 0;
+    Py_ssize_t index = -1;
+    std::string_view bare() const noexcept {
+        return {PyString_AS_STRING(name), static_cast<size_t>(bareLength)};
+    }
+};
+
+class DefIndex {
+public:
+    // A definition whose stored index may no longer be its position.
+    struct Candidate {
+        Py_ssize_t at;  // list index
+        py::Ref def;
+    };
+
+    explicit DefIndex(PyObject* list);
+    ~DefIndex();
+    DefIndex(const DefIndex&) = delete;
+    DefIndex& operator=(const DefIndex&) = delete;
+
+    PyObject* list() const noexcept { return list_.get(); }
+    Py_ssize_t definitionCount() const noexcept { return static_cast<Py_ssize_t>(groupOf_.size()); }
+
+    // Files `def` (at list index `at`) last in the group of its key and
+    // returns its position there: the whole-list pass counts this way.
+    Py_ssize_t append(PyObject* def, Py_ssize_t at, PyObject* scope, const DefinedName& name);
+
+    // Files every named definition of the list under its stored names and
+    // queues those whose stored index is not their position. False when a
+    // stored name cannot be indexed (not a str): the caller falls back to
+    // the table walk.
+    bool rebuild();
+
+    // Takes `def` out of its group, queueing the definitions after it.
+    void remove(PyObject* def);
+
+    // Files `def` (at list index `at`) under the names it now stores,
+    // queueing it and the definitions after it in its old and new groups.
+    // False when its names cannot be indexed.
+    bool place(PyObject* def, Py_ssize_t at);
+
+    // How many definitions of the key stand before list index `at`: the
+    // scope index of a definition there. -1 when the index no longer
+    // matches the list (a member is not where it can be found).
+    Py_ssize_t countBefore(PyObject* scope, const DefinedName& name, Py_ssize_t at);
+
+    // The position of a member in its group, or -1.
+    Py_ssize_t positionOf(PyObject* def);
+
+    // Pops the queued candidate with the lowest list index below `end`.
+    bool popCandidate(Py_ssize_t end, Candidate* out);
+    bool hasCandidates() const noexcept { return !candidates_.empty(); }
+
+    // The list length when the last call ended, for the check at the next.
+    Py_ssize_t recordedLength = -1;
+
+    // Drops the references to definitions taken out during the call. Their
+    // release can run Python code (a logical's last reference, a name's
+    // finalizer), so it waits until the index is not in use.
+    void flushReleases() noexcept;
+
+    // For the garbage collector: every reference the index holds.
+    int traverse(visitproc visit, void* arg) const;
+
+    // Whether the groups equal those `rebuild` would make now, each member
+    // at the index its name carries (the self-check).
+    bool matchesList(std::string* why);
+
+private:
+    struct Member {
+        PyObject* def;   // owned
+        Py_ssize_t at;   // its list index when last seen (checked before use)
+    };
+    struct Group {
+        py::Ref scope;
+        py::Ref bare;
+        size_t hash;
+        std::vector<Member> members;
+    };
+
+    size_t hashOf(PyObject* scope, std::string_view bare);
+    Group* find(PyObject* scope, std::string_view bare, size_t hash) const;
+    Group& findOrAdd(PyObject* def, PyObject* scope, const DefinedName& name, size_t hash);
+    void erase(Group* group);
+    void grow();
+    Py_ssize_t indexOf(Member& member);  // the member's list index, or -1
+    Py_ssize_t lowerBound(Group& group, Py_ssize_t at);  // first member not before `at`
+    void queueFrom(Group& group, size_t position);
+    void clear();
+
+    py::Ref list_;
+    std::vector<Group*> slots_;  // open addressing, linear probing; owned groups
+    size_t used_ = 0;
+    std::unordered_map<PyObject*, Group*> groupOf_;
+    std::vector<Candidate> candidates_;  // a min-heap on `at`
+    std::vector<PyObject*> released_;    // owned, dropped by flushReleases
+};
+
+// The defined name of a class/def logical (fLocalScopeName, else its name
+// token), read through the symbol-info native entry; false when it has none.
+bool readDefinedName(PyObject* logical, DefinedName* out);
+
+// The defined name without its scope index, as a str: the name itself, or
+// the logical's name token when that is it (the usual case), else a new str.
+py::Ref bareNameOf(PyObject* logical, const DefinedName& name);
+
+}  // namespace sbc
