@@ -8,8 +8,6 @@ line holding only a comment, or a blank line outside brackets.
 import tokenize
 from cStringIO import StringIO
 
-from pysource._fastaccess import LogicalLineType
-
 kOtherKind = 0
 kClassKind = 1
 kDefKind = 2
@@ -56,8 +54,9 @@ def _StatementKind(tokens):
 
 
 def _Statement(tokens, start, line):
-    """The logical of a statement or comment line from its first token's place."""
-    return LogicalLineType(tokens, start[0], _IndentWidth(line, start[1]), _StatementKind(tokens))
+    """The record of a statement or comment line from its first token's place."""
+    tokens = tuple(tokens)
+    return tokens, start[0], _IndentWidth(line, start[1]), _StatementKind(tokens)
 
 
 def _SyntaxErrorFromTokenError(exc, source, filename):
@@ -67,19 +66,14 @@ def _SyntaxErrorFromTokenError(exc, source, filename):
     return SyntaxError(msg, (filename, lineno, offset, text))
 
 
-def ReadLogicals(source, filename='<string>'):
-    """The list of logicals of `source` (a str; unicode is taken as UTF-8).
-
-    Raises SyntaxError, with the line number, for source that does not
-    tokenize (IndentationError for an inconsistent dedent).
-    """
+def _Records(source, filename='<string>'):
+    """Yields the (tokens, line number, indent, kind) record of each logical
+    of `source`, as ReadLogicals reads them."""
     if isinstance(source, unicode):
         source = source.encode('utf-8')
     if source.startswith(_kUtf8Bom):
         source = source[len(_kUtf8Bom):]
 
-    logicals = []
-    append = logicals.append
     tokens = []
     first_start = first_line = None
     depth = 0
@@ -90,10 +84,10 @@ def ReadLogicals(source, filename='<string>'):
                 if type_ == _NL and depth > 0:
                     continue
                 if tokens:
-                    append(_Statement(tokens, first_start, first_line))
+                    yield _Statement(tokens, first_start, first_line)
                     tokens = []
                 elif type_ == _NL:
-                    append(LogicalLineType((), start[0], _IndentWidth(line, start[1]), kBlankKind))
+                    yield (), start[0], _IndentWidth(line, start[1]), kBlankKind
             elif type_ not in _kNoText:
                 if not tokens:
                     first_start, first_line = start, line
@@ -109,13 +103,23 @@ def ReadLogicals(source, filename='<string>'):
     # 2.7's tokenizer ends the last line without a NEWLINE when the text has
     # no final newline, and stops silently at a last line of only whitespace.
     if tokens:
-        append(_Statement(tokens, first_start, first_line))
+        yield _Statement(tokens, first_start, first_line)
     elif source and not source.endswith('\n'):
         last = source[source.rfind('\n') + 1:]
         if not last.strip(' \t\f'):
-            append(LogicalLineType((), source.count('\n') + 1, _IndentWidth(last, len(last)),
-                                   kBlankKind))
-    return logicals
+            yield (), source.count('\n') + 1, _IndentWidth(last, len(last)), kBlankKind
+
+
+def ReadLogicals(source, filename='<string>'):
+    """The list of logicals of `source` (a str; unicode is taken as UTF-8).
+
+    Raises SyntaxError, with the line number, for source that does not
+    tokenize (IndentationError for an inconsistent dedent).
+    """
+    # Imported here so that the records can be read where the record type
+    # is not built.
+    from pysource._fastaccess import LogicalLineType
+    return [LogicalLineType(*record) for record in _Records(source, filename)]
 
 
 def ReadLogicalsFromFile(path):
