@@ -4,26 +4,28 @@ One logical per logical line, in line order: a statement (however many
 physical lines its brackets, backslashes or triple-quoted strings take), a
 line holding only a comment, or a blank line outside brackets.
 
-The same text gives the same logicals on Python 2.7 and on Python 3, Python 2
-source included: on 2.7 the tokens come from the tokenize module, on 3.x from
-a scanner here that applies 2.7's token rules to text (3.x's tokenize follows
-each 3.x version's own rules and would split backticks, `<>`, `0777L`, `ur''`
-and the like differently from one version to the next). On 3.x the tokens
-are str; on 2.7 they are byte strings.
+The same text gives the same logicals on 2.7 and on 3.x, Python 2 source
+included. On 2.7 the tokens come from the tokenize module. On 3.x they come
+from a scanner here that applies 2.7's token rules to text: 3.x's tokenize
+reads backticks, `<>`, `0777L` and the like otherwise than 2.7, and not alike
+on every 3.x version. Tokens are byte strings on 2.7 and str on 3.x.
+tools/reader_parity.py compares the two over a source tree.
 
 What still differs on 3.x, for the same file or the same bytes:
 
-- Bytes are decoded as the source declares (a UTF-8 BOM or a coding line in
-  the first two lines, else UTF-8). An unknown or conflicting declaration, or
-  bytes the encoding cannot decode, raise SyntaxError (with the line of the
-  declaration or of the first bad byte); 2.7 reads any bytes.
+- Bytes are decoded as the source declares: a UTF-8 BOM, else a coding line
+  among the first two lines, else UTF-8, by tokenize.detect_encoding. An
+  unknown codec, a BOM with a coding line other than utf-8 (even `utf8`), a
+  line that must be read for a coding line but is not UTF-8, or bytes the
+  codec cannot decode raise SyntaxError at the line of the declaration or of
+  the first bad byte. 2.7 reads any bytes.
 - A character outside ASCII outside strings and comments is one error token
   on 3.x; on 2.7 each of its bytes is one.
-- In an encoding whose multi-byte characters may hold ASCII bytes (e.g.
-  shift_jis, big5, gbk), 2.7 reads such a byte as the ASCII character, so a
-  quote or backslash inside a character can end or continue a string there.
-- str on 3.x, like unicode on 2.7, is read as it is: its coding line is not
-  applied.
+- In a codec whose multi-byte characters can hold ASCII bytes (shift_jis,
+  big5, gbk, ...), 2.7 takes such a byte for that ASCII character, so a quote
+  or backslash inside a character can end or continue a string there.
+- 2.7 reads unicode as its UTF-8 bytes, whatever its coding line says; 3.x
+  reads str as it is.
 - The `text` of a SyntaxError is str on 3.x.
 """
 
