@@ -193,21 +193,21 @@ def PyenvRoot():
         return os.path.expanduser('~/.pyenv')
 
 
-def Interpreter(spec):
-    """A path to an interpreter, from a path or a version installed under pyenv."""
-    if not spec[:1].isdigit():
-        return spec
+def Interpreter(given):
+    """The interpreter to run: `given` itself, or the pyenv install of version `given`."""
+    if not given[:1].isdigit():
+        return given
     versions = os.path.join(PyenvRoot(), 'versions')
     found = []
-    for candidate in glob.glob(os.path.join(versions, spec + '*')):
+    for candidate in glob.glob(os.path.join(versions, given + '*')):
         name = os.path.basename(candidate)
-        if name == spec or name.startswith(spec + '.'):
+        if name == given or name.startswith(given + '.'):
             major_minor = '.'.join(name.split('.')[:2])
             exe = os.path.join(candidate, 'bin', 'python' + major_minor)
             if os.path.exists(exe):
                 found.append((tuple(int(p) for p in name.split('.') if p.isdigit()), exe))
     if not found:
-        sys.exit('no Python %s under %s' % (spec, versions))
+        sys.exit('no Python %s under %s' % (given, versions))
     return max(found)[1]
 
 
