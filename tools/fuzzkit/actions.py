@@ -452,7 +452,7 @@ def Plausible(ctx, param, junk_only=False):
     names = ScopeNames(lst)
     if param in ('logical', 'scope_def'):
         if lst and rng.random() < 0.8:
-            scopes = [l for l in lst if l.fKind in (1, 2)]
+            scopes = [l for l in lst if type(l) is hostile.LogicalLineType and l.fKind in (1, 2)]
             return rng.choice(scopes if scopes and rng.random() < 0.5 else lst)
         return None if junk_only else hostile.OddLogical(rng)
     if param in ('i', 'first_comment_i', 'start_i', 'end_i', 'scope_index'):
@@ -990,7 +990,8 @@ def HostileCache(ctx):
             method = rng.choice(['GetScopeDef', 'GetBodyOfScope', '_FindScopeDef',
                                  '_FindBodyOfScopeDef', 'Clear'])
             if method == '_FindBodyOfScopeDef':
-                arg = rng.choice([None] + [l for l in ctx.doc.lst if l.fKind in (1, 2)] +
+                arg = rng.choice([None] + [l for l in ctx.doc.lst if type(l) is
+                                          hostile.LogicalLineType and l.fKind in (1, 2)] +
                                  [hostile.Value(rng, ctx.doc.lst)])
             elif method == 'Clear':
                 arg = Plausible(ctx, 'scope_names')
@@ -1133,11 +1134,14 @@ def Plant(ctx):
         ctx.finder._PrepareForFind()
         ctx.CheckUsable('a planted _PrepareForFind')
     elif ctx.plant == 'names':
-        edit = MakeEdit(ctx)
-        if edit is None or not ctx.doc.lst:
-            ctx.doc.Replace('def f():\n    pass\n', 'replace_small')
+        # A kept logical with a wrong name, then a call that visits nothing.
+        if not ctx.doc.lst:
+            ctx.doc.Replace('x = 1\n', 'replace_small')
+            ctx.WholePass('planted')
         ctx.doc.lst[-1].fScopeName = 'planted'
-        ctx.CheckNames('a planted name')
+        script = NameScript(Rows(ctx.doc.lst), [], [], ctx.doc.text, 'FindChanges([], [])')
+        ctx.Call('FindChanges[edit]', 'finder.FindChanges([], [])', ctx.finder.FindChanges, [], [])
+        ctx.CheckNames('a planted name', script)
     elif ctx.plant == 'leak':
         _kPlanted.append([object() for _ in range(5)])
 

@@ -5,6 +5,7 @@ the crash log (a file, unbuffered) before it is made, so a crash or a hang
 leaves it behind for the supervisor; its outcome is counted by call kind."""
 
 import os
+import re
 
 from pysource._fastaccess import LogicalLineType
 
@@ -41,6 +42,7 @@ def Short(obj, lst=None):
         text = repr(obj)
     except BaseException as e:  # a hostile __repr__
         text = '<%s, repr raised %s>' % (type(obj).__name__, type(e).__name__)
+    text = re.sub(r' at 0x[0-9a-f]+', '', text)   # addresses differ from run to run
     return text if len(text) <= kMaxRepr else text[:kMaxRepr] + '...'
 
 

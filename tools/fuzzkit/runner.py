@@ -33,13 +33,23 @@ class StderrSink(object):
         self.rec = recorder
         self.optimized = optimized
         self.noted = False
+        self.line = ''
 
     def write(self, text):
-        if ' ignored' in text and text.startswith('Exception'):
-            self.rec.Count('(unraisable report)', 'written')
-            if self.optimized and '_ProcessDedentedComments' in text and not self.noted:
-                self.noted = True
-                self.rec.Note('tag dedent-fail-O')
+        # The interpreter writes a report in pieces; look at whole lines.
+        self.line += text
+        if '\n' not in self.line:
+            if len(self.line) > 4096:
+                self.line = self.line[-4096:]
+            return
+        lines = self.line.split('\n')
+        self.line = lines.pop()
+        for line in lines:
+            if line.startswith('Exception') and line.endswith(' ignored'):
+                self.rec.Count('(unraisable report)', 'written')
+                if self.optimized and '_ProcessDedentedComments' in line and not self.noted:
+                    self.noted = True
+                    self.rec.Note('tag dedent-fail-O')
 
     def flush(self):
         pass
