@@ -23,6 +23,51 @@ def Fuzz(*args, **kw):
     return proc.returncode, out
 
 
+sys.path.insert(0, os.path.join(ROOT, 'tools'))
+from fuzzkit import texts  # noqa: E402
+
+
+class EditorModelTest(unittest.TestCase):
+    """The fuzzer's editor keeps what an editor keeps; a slip here would show
+    up as false names findings."""
+
+    kText = 'class A:\n    def f(self):\n        pass\n# c\nx = 1\n'
+
+    def testSpliceKeepsPrefixAndSuffixObjectsWithNewLineNumbers(self):
+        doc = texts.Document(self.kText)
+        old = list(doc.lst)
+        edit = doc.Apply([texts.Splice(2, 0, ['        y = 2', ''], 'insert')], 'insert')
+        self.assertEqual([l.fTokens for l in edit.added], [('y', '=', '2'), ()])
+        self.assertEqual(edit.removed, [])
+        self.assertTrue(all(a is b for a, b in zip(doc.lst[:2], old[:2])))
+        self.assertTrue(all(a is b for a, b in zip(doc.lst[-3:], old[-3:])))
+        self.assertEqual([l.fLineno for l in doc.lst], [1, 2, 3, 4, 5, 6, 7])
+
+    def testChangedLineIsReplacedEvenWhenItReadsTheSame(self):
+        doc = texts.Document(self.kText)
+        old = doc.lst[4]
+        edit = doc.Apply([texts.Splice(4, 1, ['x =  1'], 'type')], 'type')
+        self.assertEqual(edit.removed, [old])
+        self.assertIsNot(doc.lst[4], old)
+
+    def testBatchDropsWhatOneSubEditAddsAndALaterOneRemoves(self):
+        doc = texts.Document(self.kText)
+        edit = doc.Apply([texts.Splice(3, 0, ['z = 0'], 'a'), texts.Splice(3, 1, [], 'b')],
+                         'batch')
+        self.assertEqual((edit.added, edit.removed), ([], []))
+        self.assertEqual(doc.text, self.kText)
+
+    def testUndoPutsBackTheRemovedObjects(self):
+        doc = texts.Document(self.kText)
+        old = list(doc.lst)
+        doc.Apply([texts.Splice(1, 2, [], 'delete')], 'delete')
+        edit = doc.Undo()
+        self.assertEqual(doc.text, self.kText)
+        self.assertTrue(all(a is b for a, b in zip(doc.lst, old)))
+        self.assertEqual([l.fLineno for l in doc.lst], [1, 2, 3, 4, 5])
+        self.assertEqual(len(edit.added), 2)
+
+
 class FuzzSmokeTest(unittest.TestCase):
 
     def setUp(self):

@@ -865,9 +865,16 @@ def act_kwargs_clear(ctx, self, base, args, kwargs):
 
 def act_instance_attr(ctx, self, base, args, kwargs):
     rng = ctx.rng
-    step = rng.choice(hostile.kFinderSteps)
+    steps = [s for s in hostile.kFinderSteps if not (ctx.known and s == '_Clear')]
+    step = rng.choice(steps)
     value = rng.choice([5, None, lambda *a: hostile.Value(rng, ctx.doc.lst),
                         getattr(CChangeFinder, step).__get__(self)])
+    if step == '_Clear':
+        if callable(value) and not hasattr(value, '__self__'):
+            ctx.legit_finding = True   # a _Clear that skips the base one keeps the find open
+        elif not callable(value):
+            ctx.tags.add('clear-fails')
+    ctx.rec.Note('instance attribute %s = %s' % (step, Short(value)))
     try:
         self.__dict__[step] = value
     except AttributeError:
@@ -934,7 +941,10 @@ def ScheduleActs(ctx, steps):
         act = rng.choice(acts)
         repeat = act in (act_gc, act_wrong, act_raise, act_yield, act_trap_result) and \
             rng.random() < 0.2
-        ctx.plan.Add(step, rng.randint(1, 6), act, repeat)
+        on_call = rng.randint(1, 6)
+        ctx.rec.Note('schedule %s on call %d%s of %s' % (act.__name__, on_call,
+                                                        ' and after' if repeat else '', step))
+        ctx.plan.Add(step, on_call, act, repeat)
 
 
 def OnFire(ctx, step, act):

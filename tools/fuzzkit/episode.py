@@ -347,6 +347,7 @@ def RunEpisode(seed, index, recorder, known, optimized, steps=None, profile=None
         for n in range(steps or ctx.rng.randint(8, 40)):
             action = 'Plant' if plant and n == 1 else ctx.Pick(actions.kTables[ctx.profile])
             recorder.Note('action %d: %s' % (n, action))
+            ctx.tags.clear()   # a shape counts for the action it was met in
             getattr(actions, action)(ctx)
     except Finding as f:
         f.tags = sorted(ctx.tags)

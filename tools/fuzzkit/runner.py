@@ -287,7 +287,9 @@ class Supervisor(object):
         """The child died or was killed inside an episode."""
         episode, probe, _ = child.current
         log = child.LogLines()
-        tags = sorted(set(l.split('# tag ', 1)[1] for l in log if '# tag ' in l))
+        starts = [k for k, l in enumerate(log) if l.startswith('  # action ')]
+        tail = log[starts[-1]:] if starts else log
+        tags = sorted(set(l.split('# tag ', 1)[1] for l in tail if '# tag ' in l))
         profile = [l.split('(profile ', 1)[1].rstrip(')') for l in log[:1] if '(profile ' in l]
         self.Finding({'kind': kind, 'detail': detail, 'episode': episode, 'tags': tags,
                       'profile': profile[0] if profile else '?', 'script': None, 'log': log[-400:],
