@@ -108,10 +108,14 @@ def CallFindChanges(ctx, finder, added, removed, kind='FindChanges[edit]'):
         return ctx.Call(kind, 'finder.FindChanges(removed_list=%s, added_list=%s)' % (
             ctx.S(removed), ctx.S(added)), finder.FindChanges, removed_list=removed,
             added_list=added)
-    ctx.kwargs = {'added_list': added, 'removed_list': removed}
+    # The dict goes to the call as it is and holds the only references to
+    # the lists, as when a caller builds it in place.
+    text = 'finder.FindChanges(**kw)  # kw = {added_list: %s, removed_list: %s}' % (
+        ctx.S(added), ctx.S(removed))
+    ctx.kwargs = {'added_list': list(added) if type(added) is list else added,
+                  'removed_list': list(removed) if type(removed) is list else removed}
     try:
-        return ctx.Call(kind, 'finder.FindChanges(**kw)  # kw = {added_list: %s, removed_list: '
-                        '%s}' % (ctx.S(added), ctx.S(removed)), finder.FindChanges, **ctx.kwargs)
+        return ctx.rec.CallWith(kind, text, finder.FindChanges, (), ctx.kwargs)
     finally:
         ctx.kwargs = None
 
@@ -939,6 +943,8 @@ def ScheduleActs(ctx, steps):
             if step == '_Clear':
                 acts = list(kClearSafe)
         act = rng.choice(acts)
+        if not ctx.known and rng.random() < 0.05:
+            act = act_kwargs_clear
         repeat = act in (act_gc, act_wrong, act_raise, act_yield, act_trap_result) and \
             rng.random() < 0.2
         on_call = rng.randint(1, 6)
