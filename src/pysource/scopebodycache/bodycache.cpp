@@ -67,7 +67,11 @@ void cacheClear(PyObject* field) {
     PyDict_Clear(dict.get());
 }
 
-py::Ref callMethod(PyObject* self, PyObject* name, PyObject* arg) {
+// self.<name>(arg) as a normal method call. An instance of the class itself
+// (no subclass, no instance dictionary) can only find our own method, so
+// that is run directly.
+py::Ref callMethod(PyObject* self, PyObject* name, PyObject* arg, py::Ref (*own)(PyObject*, PyObject*)) {
+    if (Py_TYPE(self) == scopeBodyCacheType()) return own(self, arg);
     return py::check(PyObject_CallMethodObjArgs(self, name, arg, nullptr));
 }
 
@@ -98,19 +102,91 @@ void forEach(PyObject* seq, Body&& body) {
     }
 }
 
+// --- Indexed bodies -----------------------------------------------------------
+// Resolving a name looks its leaf up in the parent's body; scanning that
+// body each time makes resolving every scope of a file quadratic in the
+// number of definitions at a level. The first search of a body indexes its
+// definitions by defined name (first one wins, as the scan has it), and the
+// index serves while that very list, with that length, is the body found.
+// An index is not made for a body the scan would fail on (an item that is
+// not a logical, a defined name that is not a str): that body is scanned.
+
+void dropIndexFor(PyObject* self, PyObject* scopeName) {
+    PyObject* indexes = bodyCacheState(self).bodyIndexes;
+    if (indexes == nullptr) return;
+    py::Ref keep = py::Ref::own(indexes);
+    if (PyDict_DelItem(indexes, scopeName) < 0) PyErr_Clear();  // absent, or unhashable
+}
+
+// {defined name: first position} of `body`, or None when it cannot be made.
+py::Ref indexBody(PyObject* body) {
+    py::Ref names = py::check(PyDict_New());
+    for (Py_ssize_t i = 0; i < PyList_GET_SIZE(body); ++i) {
+        PyObject* item = PyList_GET_ITEM(body, i);
+        if (!logicalCheck(item)) return py::Ref::none();
+        PyObject* defined = localScopeDefined(asLogical(item));
+        if (defined == nullptr) continue;
+        if (!PyString_CheckExact(defined)) return py::Ref::none();
+        py::Ref position = py::check(PyInt_FromSsize_t(i));
+        if (py::checkStatus(PyDict_Contains(names.get(), defined)) == 0) {
+            py::checkStatus(PyDict_SetItem(names.get(), defined, position.get()));
+        }
+    }
+    return names;
+}
+
+// The definition named `leaf` in `body` through the index, or an empty
+// handle when the index cannot answer (then the body is scanned). Sets
+// `absent` when the index knows that no definition has that name.
+py::Ref findInIndexedBody(PyObject* self, PyObject* scopeName, PyObject* body, PyObject* leaf, bool* absent) {
+    *absent = false;
+    if (!PyString_CheckExact(scopeName) || !PyString_CheckExact(leaf) || !PyList_CheckExact(body)) return {};
+    BodyCacheState& s = bodyCacheState(self);
+    if (s.bodyIndexes == nullptr) s.bodyIndexes = py::check(PyDict_New()).release();
+    py::Ref indexes = py::Ref::own(s.bodyIndexes);
+    py::Ref entry = py::Ref::own(PyDict_GetItem(indexes.get(), scopeName));
+    const Py_ssize_t size = PyList_GET_SIZE(body);
+    if (!entry || PyTuple_GET_ITEM(entry.get(), 0) != body ||
+        PyInt_AS_LONG(PyTuple_GET_ITEM(entry.get(), 1)) != size) {
+        py::Ref names = indexBody(body);
+        py::Ref length = py::check(PyInt_FromSsize_t(size));
+        entry = py::check(PyTuple_Pack(3, body, length.get(), names.get()));
+        py::checkStatus(PyDict_SetItem(indexes.get(), scopeName, entry.get()));
+    }
+    PyObject* names = PyTuple_GET_ITEM(entry.get(), 2);
+    if (names == Py_None) return {};
+    PyObject* position = PyDict_GetItem(names, leaf);
+    if (position == nullptr) {
+        *absent = true;
+        return {};
+    }
+    // The one it names is checked: still there, still of that name.
+    const Py_ssize_t i = PyInt_AS_LONG(position);
+    if (i >= PyList_GET_SIZE(body)) return {};
+    PyObject* item = PyList_GET_ITEM(body, i);
+    if (!logicalCheck(item)) return {};
+    PyObject* defined = localScopeDefined(asLogical(item));
+    if (defined == nullptr || !PyString_CheckExact(defined) || !_PyString_Eq(defined, leaf)) return {};
+    return py::Ref::own(item);
+}
+
 // --- The lookups ------------------------------------------------------------
+
+py::Ref findScopeDef(PyObject* self, PyObject* scopeName);
+py::Ref findBodyOfScopeDef(PyObject* self, PyObject* scopeDef);
+py::Ref getBodyOfScope(PyObject* self, PyObject* scopeName);
 
 py::Ref getScopeDef(PyObject* self, PyObject* scopeName) {
     if (py::Ref cached = cacheGet(bodyCacheState(self).scopeDefCache, scopeName)) return cached;
-    py::Ref def = callMethod(self, gNames.FindScopeDef, scopeName);
+    py::Ref def = callMethod(self, gNames.FindScopeDef, scopeName, findScopeDef);
     cacheStore(bodyCacheState(self).scopeDefCache, scopeName, def.get());
     return def;
 }
 
 py::Ref getBodyOfScope(PyObject* self, PyObject* scopeName) {
     if (py::Ref cached = cacheGet(bodyCacheState(self).scopeBodyCache, scopeName)) return cached;
-    py::Ref def = callMethod(self, gNames.GetScopeDef, scopeName);
-    py::Ref body = callMethod(self, gNames.FindBodyOfScopeDef, def.get());
+    py::Ref def = callMethod(self, gNames.GetScopeDef, scopeName, getScopeDef);
+    py::Ref body = callMethod(self, gNames.FindBodyOfScopeDef, def.get(), findBodyOfScopeDef);
     cacheStore(bodyCacheState(self).scopeBodyCache, scopeName, body.get());
     return body;
 }
@@ -128,9 +204,12 @@ py::Ref findScopeDef(PyObject* self, PyObject* scopeName) {
     const Py_ssize_t count = py::checkSize(PyObject_Size(parts.get()));
     py::Ref parentName = parentScopeName(parts.get(), count);
     py::Ref leafName = py::check(PySequence_GetItem(parts.get(), -1));
-    py::Ref parentBody = callMethod(self, gNames.GetBodyOfScope, parentName.get());
+    py::Ref parentBody = callMethod(self, gNames.GetBodyOfScope, parentName.get(), getBodyOfScope);
 
-    py::Ref found;
+    bool absent = false;
+    py::Ref found = findInIndexedBody(self, parentName.get(), parentBody.get(), leafName.get(), &absent);
+    if (found) return found;
+    if (absent) msg::raiseWithRepr(PyExc_KeyError, msg::kNoScopeFound, scopeName);
     forEach(parentBody.get(), [&](PyObject* logical) {
         const Logical* l = requireLogical(logical);
         py::Ref defined = py::Ref::own(localScopeDefinedChecked(l));
@@ -151,7 +230,7 @@ py::Ref findBodyOfScopeDef(PyObject* self, PyObject* scopeDef) {
         const Logical* def = requireLogical(scopeDef);
         if (!isScopeStart(def)) msg::raiseWithRepr(PyExc_ValueError, msg::kMustStartScope, scopeDef);
         py::Ref list = py::Ref::own(bodyCacheState(self).logicalList);
-        first = findIndexOfLogical(list.get(), scopeDef) + 1;
+        first = findIndexOfLogical(list.get(), scopeDef, nativeSiblingsCurrent()) + 1;
         if (first == 0) msg::raise(PyExc_IndexError, msg::kDefNotInList);
         defIndent = def->fIndent;
     }
@@ -189,6 +268,7 @@ void destroyImpl(PyObject* self) {
     BodyCacheState& s = bodyCacheState(self);
     py::storeSlot(&s.scopeBodyCache, Py_None);
     py::storeSlot(&s.scopeDefCache, Py_None);
+    dropBodyIndexes(self);
 }
 
 void clear(PyObject* self, PyObject* scopeNames) {
@@ -197,10 +277,12 @@ void clear(PyObject* self, PyObject* scopeNames) {
             py::checkStatus(PyObject_RichCompareBool(item, gNames.star, Py_EQ))) {
             cacheClear(bodyCacheState(self).scopeBodyCache);
             cacheClear(bodyCacheState(self).scopeDefCache);
+            dropBodyIndexes(self);
             return false;
         }
         cachePop(bodyCacheState(self).scopeBodyCache, item);
         cachePop(bodyCacheState(self).scopeDefCache, item);
+        dropIndexFor(self, item);
         return true;
     });
 }
@@ -276,6 +358,8 @@ const FunctionSpec kMethods[] = {
 }  // namespace
 
 PyTypeObject* scopeBodyCacheType() noexcept { return &BodyCacheType; }
+
+void dropBodyIndexes(PyObject* self) noexcept { bodyCacheState(self).clearInternal(); }
 
 void readyScopeBodyCacheType() {
     BodyCacheType.tp_name = "pysource.scopebodycache.CScopeBodyCache";

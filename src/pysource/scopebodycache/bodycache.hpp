@@ -21,13 +21,24 @@ struct BodyCacheState {
     // list; scopeDefCache: full name -> scope def.
     SBC_BODY_CACHE_FIELDS(SBC_FIELD_MEMBER)
 
+    // Internal, never pickled: for each scope name whose body was searched
+    // for a definition, (body list, its length, {defined name: first
+    // position}), or null. Dropped with the body's cache entry.
+    PyObject* bodyIndexes;
+
     template <class Visit>
     void forEachObject(Visit&& visit) {
         SBC_BODY_CACHE_FIELDS(SBC_FIELD_VISIT)
     }
-    int traverseInternal(visitproc, void*) const { return 0; }
-    void clearInternal() noexcept {}
+    int traverseInternal(visitproc visit, void* arg) const {
+        Py_VISIT(bodyIndexes);
+        return 0;
+    }
+    void clearInternal() noexcept { Py_CLEAR(bodyIndexes); }
 };
+
+// Forgets what was built for the old state (after __setstate__).
+void dropBodyIndexes(PyObject* self) noexcept;
 
 // Our fields follow whatever instance size the base class has at import.
 extern Py_ssize_t gBodyCacheStateOffset;

@@ -150,6 +150,17 @@ Py_ssize_t DefIndex::indexOf(Member& member) {
 Py_ssize_t DefIndex::lowerBound(Group& group, Py_ssize_t at) {
     size_t lo = 0;
     size_t hi = group.members.size();
+    // A group out of list order means the list was rearranged without the
+    // finder being told: the index no longer matches it. Small groups (all
+    // but a few) are checked whole on each use.
+    if (hi <= 8) {
+        Py_ssize_t previous = -1;
+        for (Member& m : group.members) {
+            const Py_ssize_t i = indexOf(m);
+            if (i <= previous) return -1;
+            previous = i;
+        }
+    }
     while (lo < hi) {
         const size_t mid = lo + (hi - lo) / 2;
         const Py_ssize_t i = indexOf(group.members[mid]);
@@ -174,11 +185,11 @@ void DefIndex::queueFrom(Group& group, size_t position) {
 }
 
 Py_ssize_t DefIndex::append(PyObject* def, Py_ssize_t at, PyObject* scope, const DefinedName& name) {
-    if (groupOf_.count(def) != 0) remove(def);
+    if (groupOf_.find(def) != nullptr) remove(def);
     Group& group = findOrAdd(def, scope, name, hashOf(scope, name.bare()));
     Py_INCREF(def);
     group.members.push_back({def, at});
-    groupOf_[def] = &group;
+    groupOf_.set(def, &group);
     return static_cast<Py_ssize_t>(group.members.size()) - 1;
 }
 
@@ -213,10 +224,10 @@ bool DefIndex::rebuild() {
 }
 
 void DefIndex::remove(PyObject* def) {
-    auto it = groupOf_.find(def);
-    if (it == groupOf_.end()) return;
-    Group* group = it->second;
-    groupOf_.erase(it);
+    Group** found = groupOf_.find(def);
+    if (found == nullptr) return;
+    Group* group = *found;
+    groupOf_.erase(def);
     auto& members = group->members;
     const auto pos = std::find_if(members.begin(), members.end(), [&](const Member& m) { return m.def == def; });
     const size_t position = static_cast<size_t>(pos - members.begin());
@@ -237,10 +248,13 @@ bool DefIndex::place(PyObject* def, Py_ssize_t at) {
     if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return false;
     Group& group = findOrAdd(def, scope, name, hashOf(scope, name.bare()));
     const Py_ssize_t position = lowerBound(group, at);
-    if (position < 0) return false;
+    if (position < 0) {
+        if (group.members.empty()) erase(&group);
+        return false;
+    }
     Py_INCREF(def);
     group.members.insert(group.members.begin() + position, Member{def, at});
-    groupOf_[def] = &group;
+    groupOf_.set(def, &group);
     queueFrom(group, static_cast<size_t>(position));
     return true;
 }
@@ -252,9 +266,9 @@ Py_ssize_t DefIndex::countBefore(PyObject* scope, const DefinedName& name, Py_ss
 }
 
 Py_ssize_t DefIndex::positionOf(PyObject* def) {
-    auto it = groupOf_.find(def);
-    if (it == groupOf_.end()) return -1;
-    auto& members = it->second->members;
+    Group** found = groupOf_.find(def);
+    if (found == nullptr) return -1;
+    auto& members = (*found)->members;
     for (size_t k = 0; k < members.size(); ++k) {
         if (members[k].def == def) return indexOf(members[k]) < 0 ? -1 : static_cast<Py_ssize_t>(k);
     }
@@ -271,7 +285,11 @@ bool DefIndex::popCandidate(Py_ssize_t end, Candidate* out) {
 
 int DefIndex::traverse(visitproc visit, void* arg) const {
     Py_VISIT(list_.get());
-    for (const auto& entry : groupOf_) Py_VISIT(entry.first);
+    int status = 0;
+    groupOf_.forEach([&](const void* def, Group*) {
+        if (status == 0) status = visit(static_cast<PyObject*>(const_cast<void*>(def)), arg);
+    });
+    if (status != 0) return status;
     for (const Candidate& c : candidates_) Py_VISIT(c.def.get());
     for (PyObject* o : released_) Py_VISIT(o);
     return 0;

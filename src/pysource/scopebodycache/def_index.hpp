@@ -17,12 +17,93 @@
 
 #include "common/pyref.hpp"
 
+#include <cstdint>
+
 #include <memory>
 #include <string_view>
-#include <unordered_map>
 #include <vector>
 
 namespace sbc {
+
+// Pointer keys to values, open addressing: the index files every
+// definition of a file here, and a node allocation per entry would cost
+// more than the rest of filing it.
+template <class V>
+class PointerMap {
+public:
+    PointerMap() : slots_(16) {}
+    size_t size() const noexcept { return used_; }
+    void clear() {
+        slots_.assign(16, Slot());
+        used_ = 0;
+    }
+    V* find(const void* key) noexcept {
+        const size_t mask = slots_.size() - 1;
+        for (size_t i = home(key, mask);; i = (i + 1) & mask) {
+            if (slots_[i].key == key) return &slots_[i].value;
+            if (slots_[i].key == nullptr) return nullptr;
+        }
+    }
+    void set(const void* key, V value) {
+        if (V* v = find(key)) {
+            *v = value;
+            return;
+        }
+        if ((used_ + 1) * 2 > slots_.size()) grow();
+        place(key, value);
+        ++used_;
+    }
+    bool erase(const void* key) noexcept {
+        const size_t mask = slots_.size() - 1;
+        size_t i = home(key, mask);
+        while (slots_[i].key != key) {
+            if (slots_[i].key == nullptr) return false;
+            i = (i + 1) & mask;
+        }
+        slots_[i] = Slot();
+        // Backward shift keeps every probe chain unbroken.
+        for (size_t j = (i + 1) & mask; slots_[j].key != nullptr; j = (j + 1) & mask) {
+            const size_t h = home(slots_[j].key, mask);
+            const bool stays = i <= j ? (i < h && h <= j) : (i < h || h <= j);
+            if (stays) continue;
+            slots_[i] = slots_[j];
+            slots_[j] = Slot();
+            i = j;
+        }
+        --used_;
+        return true;
+    }
+    template <class F>
+    void forEach(F&& f) const {
+        for (const Slot& s : slots_) {
+            if (s.key != nullptr) f(s.key, s.value);
+        }
+    }
+
+private:
+    struct Slot {
+        const void* key = nullptr;
+        V value{};
+    };
+    static size_t home(const void* key, size_t mask) noexcept {
+        return (reinterpret_cast<uintptr_t>(key) >> 4) * 0x9E3779B97F4A7C15ull >> 20 & mask;
+    }
+    void place(const void* key, V value) noexcept {
+        const size_t mask = slots_.size() - 1;
+        size_t i = home(key, mask);
+        while (slots_[i].key != nullptr) i = (i + 1) & mask;
+        slots_[i] = Slot{key, value};
+    }
+    void grow() {
+        std::vector<Slot> old(slots_.size() * 2);
+        old.swap(slots_);
+        for (const Slot& s : old) {
+            if (s.key != nullptr) place(s.key, s.value);
+        }
+    }
+    std::vector<Slot> slots_;
+    size_t used_ = 0;
+};
 
 // A defined name as the symbol-info component reads it: the name object,
 // the length of its part without a scope index, and the index (-1: none;
@@ -122,7 +203,7 @@ private:
     py::Ref list_;
     std::vector<Group*> slots_;  // open addressing, linear probing; owned groups
     size_t used_ = 0;
-    std::unordered_map<PyObject*, Group*> groupOf_;
+    PointerMap<Group*> groupOf_;
     std::vector<Candidate> candidates_;  // a min-heap on `at`
     std::vector<PyObject*> released_;    // owned, dropped by flushReleases
 };

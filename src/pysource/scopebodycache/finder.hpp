@@ -57,6 +57,7 @@
 
 #include "common/messages.hpp"
 #include "common/pyref.hpp"
+#include "common/small_vector.hpp"
 #include "pysource/contracts/accessors.hpp"
 #include "pysource/contracts/destroyable_base.hpp"
 #include "pysource/scopebodycache/fields.hpp"
@@ -156,10 +157,12 @@ void unfileDefinition(PyObject* self, PyObject* logical);
 
 // The index list of the incremental pass: the Python list callers and
 // overrides see, or, in the native pass, a vector.
+using NativeIndices = SmallVector<Py_ssize_t, 16>;
+
 class IndexList {
 public:
     explicit IndexList(PyObject* list) noexcept : list_(list) {}
-    explicit IndexList(std::vector<Py_ssize_t>* vector) noexcept : vector_(vector) {}
+    explicit IndexList(NativeIndices* vector) noexcept : vector_(vector) {}
     Py_ssize_t size() const;
     Py_ssize_t at(Py_ssize_t k) const;
     void append(Py_ssize_t value);
@@ -168,19 +171,32 @@ public:
 
 private:
     PyObject* list_ = nullptr;  // borrowed; None gives the AttributeErrors of None
-    std::vector<Py_ssize_t>* vector_ = nullptr;
+    NativeIndices* vector_ = nullptr;
 };
 
 // Shared helpers of the passes.
-bool assertionsOn() noexcept;
+inline bool assertionsOn() noexcept { return Py_OptimizeFlag == 0; }
 void assertThat(bool condition);  // the assert statement: see above
 Py_ssize_t logicalListLength(PyObject* self);
 // list[i] with ordinary list indexing, checked to be a logical and owned:
 // Python code may shrink the list while it is in use.
-contracts::LogicalRef logicalAt(PyObject* self, Py_ssize_t i);
+// list[i] with ordinary list indexing (borrowed), or the interpreter's error.
+inline PyObject* listItemBorrowed(PyObject* self, Py_ssize_t i) {
+    PyObject* list = finderState(self).logicalList;
+    if (list == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
+    const Py_ssize_t n = PyList_GET_SIZE(list);
+    const Py_ssize_t at = i < 0 ? i + n : i;
+    if (at < 0 || at >= n) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
+    return PyList_GET_ITEM(list, at);
+}
+inline contracts::LogicalRef logicalAt(PyObject* self, Py_ssize_t i) {
+    return contracts::LogicalRef::own(listItemBorrowed(self, i));
+}
 // `assert self._fLogicalList[i] is logical`, evaluated only when assertions
 // are on, like the statement it stands for.
-void assertListItemIs(PyObject* self, Py_ssize_t i, PyObject* logical);
+inline void assertListItemIs(PyObject* self, Py_ssize_t i, PyObject* logical) {
+    if (assertionsOn()) assertThat(listItemBorrowed(self, i) == logical);
+}
 void addChange(PyObject* set, PyObject* name);
 // The comment step answered `end` for a run at `at`: an answer that does not
 // advance means it could not place the run (it reported why). That is an
@@ -226,6 +242,10 @@ Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logical, Py_ssize_
 py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i);
 
 // Internal steps, not visible to Python.
+// The native pass's way with the commonest edit, a code line replaced by
+// another at the same place (typing): the steps' own work for it, without
+// their general machinery. False, having done nothing, for any other edit.
+bool ProcessTypedLine(PyObject* self, PyObject* addedList, PyObject* removedList);
 void ProcessNonDedentedComment(PyObject* self, PyObject* logical, Py_ssize_t i);
 void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedIndent);
 void UpdateScopesSeen(PyObject* self, Py_ssize_t end);

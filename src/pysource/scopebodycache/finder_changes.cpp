@@ -22,7 +22,12 @@ void processRemoved(PyObject* self, PyObject* removedList, IndexList& result) {
         LogicalRef logical = LogicalRef::own(PyList_GET_ITEM(removedList, k));
         py::Ref scope = py::Ref::own(scopeName(logical.record()));
         if (scope.isNone()) continue;
-        if (isScopeStart(logical.record())) unfileDefinition(self, logical.get());
+        // One still in the list (a caller's mistake) keeps its place in the
+        // definition index, as the table walk would still count it.
+        if (native && isScopeStart(logical.record()) &&
+            findIndexOfLogical(finderState(self).logicalList, logical.get(), true) < 0) {
+            unfileDefinition(self, logical.get());
+        }
         route::LogicalInScopeChanged(self, logical.get(), scope.get());
         Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno, native);
         // A logical removed from the end of the list still moves the comment

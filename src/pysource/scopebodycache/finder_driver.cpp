@@ -13,8 +13,6 @@ namespace sbc {
 
 using namespace contracts;
 
-bool assertionsOn() noexcept { return Py_OptimizeFlag == 0; }
-
 void assertThat(bool condition) {
     if (!condition && assertionsOn()) {
         PyErr_SetNone(PyExc_AssertionError);
@@ -26,22 +24,6 @@ Py_ssize_t logicalListLength(PyObject* self) {
     PyObject* list = finderState(self).logicalList;
     if (list == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
     return PyList_GET_SIZE(list);
-}
-
-// Item i of the list, owned, with ordinary list indexing.
-py::Ref listItem(PyObject* self, Py_ssize_t i) {
-    PyObject* list = finderState(self).logicalList;
-    if (list == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotSubscriptable);
-    const Py_ssize_t n = PyList_GET_SIZE(list);
-    const Py_ssize_t at = i < 0 ? i + n : i;
-    if (at < 0 || at >= n) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
-    return py::Ref::own(PyList_GET_ITEM(list, at));
-}
-
-LogicalRef logicalAt(PyObject* self, Py_ssize_t i) { return LogicalRef::own(listItem(self, i).get()); }
-
-void assertListItemIs(PyObject* self, Py_ssize_t i, PyObject* logical) {
-    if (assertionsOn()) assertThat(listItem(self, i).get() == logical);
 }
 
 void addChange(PyObject* set, PyObject* name) {
@@ -129,10 +111,9 @@ void Clear(PyObject* self) {
     FinderState& s = finderState(self);
     // Each store may free a container whose items run Python code; the
     // fields are consistent after every single store.
-    py::storeSlot(&s.classChanges, Py_None);
-    py::storeSlot(&s.functionChanges, Py_None);
-    py::storeSlot(&s.contentsChanges, Py_None);
-    py::storeSlot(&s.scopesSeen, Py_None);
+    for (PyObject** field : {&s.classChanges, &s.functionChanges, &s.contentsChanges, &s.scopesSeen}) {
+        if (*field != Py_None) py::storeSlot(field, Py_None);
+    }
     s.endIndexForScopesSeen = 0;
     s.nextChangeIndex = -1;
     s.lastProcessedIndex = -1;
@@ -212,8 +193,10 @@ py::Ref resultTuple(const FinderState& s) {
 // that share its key are renumbered to the end of the list.
 void renumberToEnd(PyObject* self) {
     FinderState& s = finderState(self);
-    const bool scopesChanged = py::checkSize(PyObject_Size(s.classChanges)) != 0 ||
-                               py::checkSize(PyObject_Size(s.functionChanges)) != 0;
+    auto size = [](PyObject* set) {
+        return Py_TYPE(set) == &PySet_Type ? PySet_GET_SIZE(set) : py::checkSize(PyObject_Size(set));
+    };
+    const bool scopesChanged = size(s.classChanges) != 0 || size(s.functionChanges) != 0;
     if (!scopesChanged) return;
     const Py_ssize_t n = logicalListLength(self);
     s.nextChangeIndex = n;
@@ -300,7 +283,7 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
         const Py_ssize_t added = PyList_GET_SIZE(addedList);
         const Py_ssize_t total = logicalListLength(self);
         if (removedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
-        std::vector<Py_ssize_t> indices;
+        NativeIndices indices;
         IndexList list(&indices);
         if (added == total) {
             dropDefinitionIndex(self);
@@ -318,8 +301,10 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
             }
             pass.index = s.defIndex;
             pass.indexBuilt = matches;
-            processRemoved(self, removedList, list);
-            processAdded(self, addedList, list);
+            if (!ProcessTypedLine(self, addedList, removedList)) {
+                processRemoved(self, removedList, list);
+                processAdded(self, addedList, list);
+            }
             renumberToEnd(self);
         }
         result = resultTuple(s);

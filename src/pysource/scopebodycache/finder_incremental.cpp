@@ -125,6 +125,50 @@ void processAdded(PyObject* self, PyObject* addedList, IndexList& indices) {
     }
 }
 
+bool ProcessTypedLine(PyObject* self, PyObject* addedList, PyObject* removedList) {
+    if (PyList_GET_SIZE(addedList) != 1 || PyList_GET_SIZE(removedList) != 1) return false;
+    PyObject* added = PyList_GET_ITEM(addedList, 0);
+    PyObject* removed = PyList_GET_ITEM(removedList, 0);
+    if (!logicalCheck(added) || !logicalCheck(removed)) return false;
+    Logical* a = asLogical(added);
+    Logical* r = asLogical(removed);
+    if (isScopeStart(a) || isWhitespace(a) || isScopeStart(r)) return false;
+    PyObject* removedScope = scopeName(r);
+    if (!PyString_CheckExact(removedScope)) return false;
+    // The removed line maps to where the added one stands, with no comment
+    // run before it to place: otherwise the general steps take the edit.
+    FinderState& s = finderState(self);
+    PyObject* list = s.logicalList;
+    const Py_ssize_t n = PyList_GET_SIZE(list);
+    const Py_ssize_t i = gNative.indexForLineno(list, r->fLineno);
+    if (i < 0 || i >= n || PyList_GET_ITEM(list, i) != added ||
+        gNative.findIndexOfLogical(list, added) != i) {
+        PyErr_Clear();
+        return false;
+    }
+    if (i > 0) {
+        PyObject* before = PyList_GET_ITEM(list, i - 1);
+        if (!logicalCheck(before) || isWhitespace(asLogical(before))) return false;
+    }
+    // From here, what the steps do for this edit, in their order.
+    LogicalRef held = LogicalRef::own(added);
+    LogicalRef heldRemoved = LogicalRef::own(removed);
+    addChange(s.contentsChanges, removedScope);  // the removed line's scope
+    setScopeName(a, nullptr);                    // an added line is named afresh
+    setLocalScopeDefined(a, nullptr);
+    s.lastProcessedIndex = -1;
+    s.nextChangeIndex = n;
+    py::Ref scope = FindScopeNameContainingLogical(self, i);
+    requireScopeFound(scope.get(), i);
+    requireStrOrNone(scope.get());
+    setScopeName(a, scope.get());
+    s.owedScanIndent = kNoScanOwed;
+    LogicalInScopeChanged(self, added, scope.get(), Py_None, Py_None);
+    ScanForwardForChangedScopes(self, i + 1, a->fIndent);
+    s.lastProcessedIndex = i;
+    return true;
+}
+
 void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t i) {
     py::Ref scope = route::FindScopeNameContainingLogical(self, i);
     requireScopeFound(scope.get(), i);

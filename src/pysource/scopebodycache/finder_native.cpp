@@ -104,7 +104,7 @@ void IndexList::sort() {
 
 void IndexList::insert(Py_ssize_t k, Py_ssize_t value) {
     if (vector_ != nullptr) {
-        vector_->insert(vector_->begin() + k, value);
+        vector_->insert(static_cast<size_t>(k), value);
         return;
     }
     py::Ref v = py::check(PyInt_FromSsize_t(value));

@@ -1,5 +1,6 @@
 // The whole-list pass: one forward walk with a stack of open scopes, taken
 // when a file was just read or its contents were replaced.
+#include "pysource/scopebodycache/def_index.hpp"
 #include "pysource/scopebodycache/finder.hpp"
 #include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/route.hpp"
@@ -12,10 +13,50 @@ namespace sbc::finder {
 using namespace contracts;
 
 namespace {
+
 struct OpenScope {
     py::Ref name;
     int indent;
 };
+
+// The native pass's naming of one class/def line: what the routed steps
+// (the count, _GetLeafScopeWithIndex, _SetLogicalScopeNames and the
+// recording it does) give, reading the defined name once and building the
+// full name once for the stack, the change sets and the record. False when
+// the line is not the plain case (a nameless or non-str name), left to the
+// routed steps.
+bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t i, PyObject* top,
+                          py::Ref* full) {
+    DefinedName name;
+    if (!readDefinedName(logical.get(), &name) || !PyString_CheckExact(name.name) ||
+        !PyString_CheckExact(top)) {
+        return false;
+    }
+    const Py_ssize_t index = CountDefinition(self, logical.get(), i, top);
+    py::Ref local;
+    if (name.index == index) {
+        local = py::Ref::own(name.name);
+    } else {
+        py::Ref number = py::check(PyInt_FromSsize_t(index));
+        local = appendScopeSuffixes(bareNameOf(logical.get(), name).get(), number.get());
+    }
+    *full = joinTwoScopeNames(top, local.get());
+    FinderState& s = finderState(self);
+    Logical* l = logical.record();
+    PyObject* old = scopeName(l);
+    requireStrOrNone(old);
+    if (old == Py_None || !strEquals(old, top)) setScopeName(l, top);
+    PyObject* set = l->fKind == kClassLogical ? s.classChanges : s.functionChanges;
+    if (!strEquals(name.name, local.get())) {
+        setLocalScopeDefined(l, local.get());
+        addChange(s.contentsChanges, top);
+        addChange(set, full->get());
+    }
+    addChange(set, full->get());
+    addChange(s.contentsChanges, full->get());
+    return true;
+}
+
 }  // namespace
 
 void FindChangesEntireListAdded(PyObject* self) {
@@ -39,6 +80,25 @@ void FindChangesEntireListAdded(PyObject* self) {
             if (stack.empty()) msg::raise(PyExc_IndexError, msg::kListIndexOutOfRange);
         }
         PyObject* topName = stack.back().name.get();
+        if (nativePass(self)) {
+            if (!isScopeStart(logical.record())) {
+                // _SetLogicalScopeNames of a line that opens nothing.
+                PyObject* old = scopeName(logical.record());
+                requireStrOrNone(old);
+                if (old == Py_None || !strEquals(old, topName)) {
+                    requireStrOrNone(topName);
+                    setScopeName(logical.record(), topName);
+                }
+                ++i;
+                continue;
+            }
+            py::Ref full;
+            if (nameDefinitionNative(self, logical, i, topName, &full)) {
+                stack.push_back({std::move(full), indent});
+                ++i;
+                continue;
+            }
+        }
         py::Ref local = py::Ref::none();
         const bool scopeStart = isScopeStart(logical.record());
         if (scopeStart) {

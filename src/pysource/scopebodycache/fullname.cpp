@@ -39,9 +39,11 @@ py::Ref getFullNameForScopeDef(PyObject* scopeDef) {
     return joinTwoScopeNames(scope.get(), name.get());
 }
 
-bool fullNameFunctionCurrent() noexcept {
-    return PyDict_GetItem(gModuleDict, gNames.GetFullNameForScopeDef) == gFullNameFunction;
-}
+namespace {
+WatchedName gWatchedFullName;
+}  // namespace
+
+bool fullNameFunctionCurrent() noexcept { return gWatchedFullName.holds(); }
 
 py::Ref callGetFullNameForScopeDef(PyObject* scopeDef, bool native) {
     if (native) return getFullNameForScopeDef(scopeDef);
@@ -55,6 +57,7 @@ void bindModuleFunctions(PyObject* moduleDict) {
     py::Ref f = newFunction(kFullNameSpec, kModuleName);
     py::checkStatus(PyDict_SetItemString(moduleDict, kFullNameSpec.name, f.get()));
     gFullNameFunction = f.release();
+    gWatchedFullName.watch(moduleDict, gNames.GetFullNameForScopeDef, gFullNameFunction);
 }
 
 }  // namespace sbc

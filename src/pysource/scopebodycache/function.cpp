@@ -1,5 +1,7 @@
 #include "pysource/scopebodycache/function.hpp"
 
+#include "common/messages.hpp"
+
 #include <structmember.h>
 
 #include <cstring>
@@ -62,6 +64,21 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObj
                ParsedArgs& out) {
     const Py_ssize_t nargs = PyTuple_GET_SIZE(args) - first;
     const bool haveKeywords = kwargs != nullptr && PyDict_Size(kwargs) > 0;
+    // The common call: every parameter by position.
+    if (!haveKeywords && nargs == spec.total && spec.total > 0 && !(spec.total == 1 && spec.isInit)) {
+        for (int i = 0; i < spec.total; ++i) {
+            PyObject* v = PyTuple_GET_ITEM(args, first + i);
+            PyTypeObject* type;
+            const char* typeName = checkTypeName(spec.params[i].check, &type);
+            if (type != nullptr && v != Py_None && Py_TYPE(v) != type) {
+                PyErr_Format(PyExc_TypeError, msg::kArgumentType, spec.params[i].name, typeName,
+                             Py_TYPE(v)->tp_name);
+                py::fail();
+            }
+            out.set(i, v);
+        }
+        return;
+    }
 
     // Functions without parameters and single-parameter ones take no keywords.
     const bool noKeywords = spec.total == 0 || (spec.total == 1 && spec.required == 1 && !spec.isInit);

@@ -91,7 +91,7 @@ const PickledClass kScopeBodyCache = {
     0xa66c71f,
     "Incompatible checksums (%zd vs 0xa66c71f = (" SBC_BASE_FIELD_NAMES SBC_BODY_CACHE_FIELDS(SBC_FIELD_NAME_LIST) "))",
     &Names::unpickleScopeBodyCache,
-    [](PyObject*) noexcept {},
+    dropBodyIndexes,
     2 + 0 SBC_BODY_CACHE_FIELDS(SBC_COUNT_FIELD),
     {SBC_BASE_FIELDS SBC_BODY_CACHE_FIELDS(SBC_BODY_CACHE_FIELD)},
 };

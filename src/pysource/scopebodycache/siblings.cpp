@@ -190,6 +190,10 @@ void bindFunctions() {
 
 NativeSiblings gNative;
 
+namespace {
+WatchedName gWatched[5];  // _fastaccess, symbolinfo, and their three functions
+}  // namespace
+
 void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo) {
     using namespace contracts;
     NativeSiblings n;
@@ -209,19 +213,55 @@ void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo) {
     n.leafScopeNameHasIndexFunction =
         py::Ref::own(moduleAttribute(symbolinfo, gNames.LeafScopeNameHasIndex)).release();
     gNative = n;
+    gWatched[0].watch(gModuleDict, gNames.fastaccess, n.fastaccess);
+    gWatched[1].watch(gModuleDict, gNames.symbolinfo, n.symbolinfo);
+    // A sibling's own dict, taken as the module's: rebinding the global to
+    // another object fails the first two watches before these matter.
+    if (PyModule_Check(fastaccess) && PyModule_Check(symbolinfo)) {
+        gWatched[2].watch(PyModule_GetDict(fastaccess), gNames.IndexForLineno, n.indexForLinenoFunction);
+        gWatched[3].watch(PyModule_GetDict(fastaccess), gNames.FindIndexOfLogical,
+                          n.findIndexOfLogicalFunction);
+        gWatched[4].watch(PyModule_GetDict(symbolinfo), gNames.LeafScopeNameHasIndex,
+                          n.leafScopeNameHasIndexFunction);
+    }
+}
+
+// --- Watching names ----------------------------------------------------------
+// A 2.7 dict keeps its entries in one table (ma_table); a name stays in its
+// entry until the table is rebuilt. While ma_table is the table the entry
+// was found in, that entry is live memory, and if it still holds the very
+// key and value, the name maps to that value (a key has one entry).
+
+void WatchedName::watch(PyObject* dict, PyObject* name, PyObject* expected) noexcept {
+    dict_ = dict;
+    name_ = name;
+    expected_ = expected;
+    table_ = entry_ = nullptr;
+}
+
+bool WatchedName::holds() noexcept {
+    if (dict_ == nullptr || expected_ == nullptr) return false;
+    auto* d = reinterpret_cast<PyDictObject*>(dict_);
+    if (table_ == d->ma_table) {
+        auto* e = static_cast<PyDictEntry*>(entry_);
+        if (e->me_key == name_ && e->me_value == expected_) return true;
+    }
+    if (PyDict_GetItem(dict_, name_) != expected_) return false;
+    // Found where the dict's own lookup puts it; remembered for next time.
+    table_ = d->ma_table;
+    entry_ = d->ma_lookup(d, name_, reinterpret_cast<PyStringObject*>(name_)->ob_shash);
+    return true;
 }
 
 bool nativeSiblingsCurrent() noexcept {
     const NativeSiblings& n = gNative;
-    if (!n.indexForLineno || !n.findIndexOfLogical || !n.leafScopeNameHasIndex || !n.scopeNameSuffix ||
-        !n.indexForLinenoFunction || !n.findIndexOfLogicalFunction || !n.leafScopeNameHasIndexFunction) {
+    if (!n.indexForLineno || !n.findIndexOfLogical || !n.leafScopeNameHasIndex || !n.scopeNameSuffix) {
         return false;
     }
-    return PyDict_GetItem(gModuleDict, gNames.fastaccess) == n.fastaccess &&
-           PyDict_GetItem(gModuleDict, gNames.symbolinfo) == n.symbolinfo &&
-           moduleAttribute(n.fastaccess, gNames.IndexForLineno) == n.indexForLinenoFunction &&
-           moduleAttribute(n.fastaccess, gNames.FindIndexOfLogical) == n.findIndexOfLogicalFunction &&
-           moduleAttribute(n.symbolinfo, gNames.LeafScopeNameHasIndex) == n.leafScopeNameHasIndexFunction;
+    for (WatchedName& w : gWatched) {
+        if (!w.holds()) return false;
+    }
+    return true;
 }
 
 PyObject* lookupGlobal(PyObject* name) {

@@ -65,6 +65,23 @@ void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo);
 // then the same as the lookup and call. Runs no Python code.
 bool nativeSiblingsCurrent() noexcept;
 
+// One name of a dict, watched for still holding an expected object. Asked at
+// every FindChanges call, so it remembers where the name's entry was and
+// only looks the name up again when the dict has moved its entries.
+class WatchedName {
+public:
+    WatchedName() noexcept = default;
+    void watch(PyObject* dict, PyObject* name, PyObject* expected) noexcept;
+    bool holds() noexcept;
+
+private:
+    PyObject* dict_ = nullptr;      // borrowed: module dicts live as long as the process here
+    PyObject* name_ = nullptr;      // an interned str
+    PyObject* expected_ = nullptr;  // borrowed from what keeps it (the import-time snapshot)
+    void* table_ = nullptr;         // the dict's entry table when the entry was found
+    void* entry_ = nullptr;
+};
+
 // Calls of the siblings' Python-level functions, looked up by name through
 // the module globals `_fastaccess` and `symbolinfo` at each call; with
 // `native` (the caller has checked nativeSiblingsCurrent), their native

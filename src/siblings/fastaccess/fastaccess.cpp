@@ -316,9 +316,40 @@ PyMethodDef gLogicalMethods[] = {
 
 constexpr Py_ssize_t kNotLogical = -1;
 
+Py_ssize_t lowerBoundSearch(PyObject* list, long long lineno);
+
+// The last answer, tried first: an edit asks about one place several
+// times (the removed line's number, then the added line). Only a pointer
+// and numbers are kept, and the answer is checked against the list before
+// it is used, so a changed or freed list costs a search, never a wrong one.
+struct LastBound {
+    PyObject* list = nullptr;
+    long long lineno = 0;
+    Py_ssize_t index = -1;
+};
+LastBound gLastBound;
+
 // Index of the first logical with fLineno >= lineno, or kNotLogical when the
 // search met an item that is not a logical.
 Py_ssize_t lowerBound(PyObject* list, long long lineno) {
+    const LastBound& last = gLastBound;
+    if (last.list == list && last.lineno == lineno) {
+        const Py_ssize_t i = last.index;
+        const Py_ssize_t n = PyList_GET_SIZE(list);
+        if (i >= 0 && i <= n) {
+            PyObject* at = i < n ? PyList_GET_ITEM(list, i) : nullptr;
+            PyObject* before = i > 0 ? PyList_GET_ITEM(list, i - 1) : nullptr;
+            const bool atOk = at == nullptr || (isLogical(at) && asLogical(at)->fLineno >= lineno);
+            const bool beforeOk = before == nullptr || (isLogical(before) && asLogical(before)->fLineno < lineno);
+            if (atOk && beforeOk) return i;
+        }
+    }
+    const Py_ssize_t found = lowerBoundSearch(list, lineno);
+    if (found != kNotLogical) gLastBound = {list, lineno, found};
+    return found;
+}
+
+Py_ssize_t lowerBoundSearch(PyObject* list, long long lineno) {
     Py_ssize_t lo = 0;
     Py_ssize_t hi = PyList_GET_SIZE(list);
     while (lo < hi) {
