@@ -56,11 +56,13 @@ void DefIndex::clear() {
     for (Group*& g : slots_) {
         if (g == nullptr) continue;
         for (Member& m : g->members) released_.push_back(m.def);
-        delete g;
         g = nullptr;
     }
+    pool_.clear();
+    free_.clear();
     used_ = 0;
     groupOf_.clear();
+    groupOfBuilt_ = false;
     for (Candidate& c : candidates_) released_.push_back(c.def.release());
     candidates_.clear();
 }
@@ -84,7 +86,7 @@ DefIndex::Group* DefIndex::find(PyObject* scope, std::string_view bare, size_t h
     for (size_t i = hash & mask;; i = (i + 1) & mask) {
         Group* g = slots_[i];
         if (g == nullptr) return nullptr;
-        if (g->hash == hash && sameStr(g->scope.get(), scope) && sameBytes(g->bare.get(), bare)) return g;
+        if (g->hash == hash && sameStr(g->scope.get(), scope) && g->bare() == bare) return g;
     }
 }
 
@@ -100,19 +102,26 @@ void DefIndex::grow() {
     }
 }
 
-DefIndex::Group& DefIndex::findOrAdd(PyObject* def, PyObject* scope, const DefinedName& name, size_t hash) {
+DefIndex::Group& DefIndex::findOrAdd(PyObject* scope, const DefinedName& name, size_t hash) {
     if (Group* g = find(scope, name.bare(), hash)) return *g;
     if ((used_ + 1) * 2 > slots_.size()) grow();
-    auto g = std::make_unique<Group>();
+    Group* g;
+    if (!free_.empty()) {
+        g = free_.back();
+        free_.pop_back();
+    } else {
+        g = &pool_.emplace_back();
+    }
     g->scope = py::Ref::own(scope);
-    g->bare = bareNameOf(def, name);
+    g->bareSource = py::Ref::own(name.name);
+    g->bareLength = name.bareLength;
     g->hash = hash;
     const size_t mask = slots_.size() - 1;
     size_t i = hash & mask;
     while (slots_[i] != nullptr) i = (i + 1) & mask;
-    slots_[i] = g.release();
+    slots_[i] = g;
     ++used_;
-    return *slots_[i];
+    return *g;
 }
 
 void DefIndex::erase(Group* group) {
@@ -130,7 +139,10 @@ void DefIndex::erase(Group* group) {
         i = j;
     }
     --used_;
-    delete group;
+    group->scope.reset();
+    group->bareSource.reset();
+    group->members.clear();
+    free_.push_back(group);
 }
 
 Py_ssize_t DefIndex::indexOf(Member& member) {
@@ -185,11 +197,11 @@ void DefIndex::queueFrom(Group& group, size_t position) {
 }
 
 Py_ssize_t DefIndex::append(PyObject* def, Py_ssize_t at, PyObject* scope, const DefinedName& name) {
-    if (groupOf_.find(def) != nullptr) remove(def);
-    Group& group = findOrAdd(def, scope, name, hashOf(scope, name.bare()));
+    if (groupOfBuilt_ && groupOf_.find(def) != nullptr) remove(def);
+    Group& group = findOrAdd(scope, name, hashOf(scope, name.bare()));
     Py_INCREF(def);
     group.members.push_back({def, at});
-    groupOf_.set(def, &group);
+    if (groupOfBuilt_) groupOf_.set(def, &group);
     return static_cast<Py_ssize_t>(group.members.size()) - 1;
 }
 
@@ -223,7 +235,26 @@ bool DefIndex::rebuild() {
     return true;
 }
 
+void DefIndex::ensureGroupOf() {
+    if (groupOfBuilt_) return;
+    groupOf_.clear();
+    for (Group* g : slots_) {
+        if (g == nullptr) continue;
+        for (const Member& m : g->members) groupOf_.set(m.def, g);
+    }
+    groupOfBuilt_ = true;
+}
+
+size_t DefIndex::memberCount() const {
+    size_t count = 0;
+    for (const Group* g : slots_) {
+        if (g != nullptr) count += g->members.size();
+    }
+    return count;
+}
+
 void DefIndex::remove(PyObject* def) {
+    ensureGroupOf();
     Group** found = groupOf_.find(def);
     if (found == nullptr) return;
     Group* group = *found;
@@ -231,7 +262,7 @@ void DefIndex::remove(PyObject* def) {
     auto& members = group->members;
     const auto pos = std::find_if(members.begin(), members.end(), [&](const Member& m) { return m.def == def; });
     const size_t position = static_cast<size_t>(pos - members.begin());
-    members.erase(pos);
+    members.erase(position);
     released_.push_back(def);
     if (members.empty()) {
         erase(group);
@@ -246,15 +277,15 @@ bool DefIndex::place(PyObject* def, Py_ssize_t at) {
     DefinedName name;
     if (scope == Py_None || !readDefinedName(def, &name)) return true;
     if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return false;
-    Group& group = findOrAdd(def, scope, name, hashOf(scope, name.bare()));
+    Group& group = findOrAdd(scope, name, hashOf(scope, name.bare()));
     const Py_ssize_t position = lowerBound(group, at);
     if (position < 0) {
         if (group.members.empty()) erase(&group);
         return false;
     }
     Py_INCREF(def);
-    group.members.insert(group.members.begin() + position, Member{def, at});
-    groupOf_.set(def, &group);
+    group.members.insert(static_cast<size_t>(position), Member{def, at});
+    groupOf_.set(def, &group);  // remove() above made the map
     queueFrom(group, static_cast<size_t>(position));
     return true;
 }
@@ -266,6 +297,7 @@ Py_ssize_t DefIndex::countBefore(PyObject* scope, const DefinedName& name, Py_ss
 }
 
 Py_ssize_t DefIndex::positionOf(PyObject* def) {
+    ensureGroupOf();
     Group** found = groupOf_.find(def);
     if (found == nullptr) return -1;
     auto& members = (*found)->members;
@@ -285,11 +317,10 @@ bool DefIndex::popCandidate(Py_ssize_t end, Candidate* out) {
 
 int DefIndex::traverse(visitproc visit, void* arg) const {
     Py_VISIT(list_.get());
-    int status = 0;
-    groupOf_.forEach([&](const void* def, Group*) {
-        if (status == 0) status = visit(static_cast<PyObject*>(const_cast<void*>(def)), arg);
-    });
-    if (status != 0) return status;
+    for (const Group* g : slots_) {
+        if (g == nullptr) continue;
+        for (const Member& m : g->members) Py_VISIT(m.def);
+    }
     for (const Candidate& c : candidates_) Py_VISIT(c.def.get());
     for (PyObject* o : released_) Py_VISIT(o);
     return 0;
@@ -301,18 +332,15 @@ bool DefIndex::matchesList(std::string* why) {
         *why = "the list holds names that cannot be indexed";
         return false;
     }
-    if (fresh.groupOf_.size() != groupOf_.size()) {
-        *why = "the index holds " + std::to_string(groupOf_.size()) + " definitions, the list " +
-               std::to_string(fresh.groupOf_.size());
+    if (fresh.memberCount() != memberCount()) {
+        *why = "the index holds " + std::to_string(memberCount()) + " definitions, the list " +
+               std::to_string(fresh.memberCount());
         return false;
     }
     for (Group* g : fresh.slots_) {
         if (g == nullptr) continue;
-        Group* mine = find(g->scope.get(), {PyString_AS_STRING(g->bare.get()),
-                                            static_cast<size_t>(PyString_GET_SIZE(g->bare.get()))},
-                           g->hash);
-        const std::string key = std::string(PyString_AS_STRING(g->scope.get())) + " / " +
-                                PyString_AS_STRING(g->bare.get());
+        Group* mine = find(g->scope.get(), g->bare(), g->hash);
+        const std::string key = std::string(PyString_AS_STRING(g->scope.get())) + " / " + std::string(g->bare());
         if (mine == nullptr || mine->members.size() != g->members.size()) {
             *why = "the group " + key + " differs";
             return false;

@@ -16,8 +16,10 @@
 #pragma once
 
 #include "common/pyref.hpp"
+#include "common/small_vector.hpp"
 
 #include <cstdint>
+#include <deque>
 
 #include <memory>
 #include <string_view>
@@ -131,7 +133,7 @@ public:
     DefIndex& operator=(const DefIndex&) = delete;
 
     PyObject* list() const noexcept { return list_.get(); }
-    Py_ssize_t definitionCount() const noexcept { return static_cast<Py_ssize_t>(groupOf_.size()); }
+    Py_ssize_t definitionCount() const { return static_cast<Py_ssize_t>(memberCount()); }
 
     // Files `def` (at list index `at`) last in the group of its key and
     // returns its position there: the whole-list pass counts this way.
@@ -185,14 +187,18 @@ private:
     };
     struct Group {
         py::Ref scope;
-        py::Ref bare;
-        size_t hash;
-        std::vector<Member> members;
+        py::Ref bareSource;  // a defined name whose first bareLength bytes are the key
+        Py_ssize_t bareLength = 0;
+        size_t hash = 0;
+        SmallVector<Member, 2> members;  // most keys have one definition
+        std::string_view bare() const noexcept {
+            return {PyString_AS_STRING(bareSource.get()), static_cast<size_t>(bareLength)};
+        }
     };
 
     size_t hashOf(PyObject* scope, std::string_view bare);
     Group* find(PyObject* scope, std::string_view bare, size_t hash) const;
-    Group& findOrAdd(PyObject* def, PyObject* scope, const DefinedName& name, size_t hash);
+    Group& findOrAdd(PyObject* scope, const DefinedName& name, size_t hash);
     void erase(Group* group);
     void grow();
     Py_ssize_t indexOf(Member& member);  // the member's list index, or -1
@@ -201,9 +207,16 @@ private:
     void clear();
 
     py::Ref list_;
-    std::vector<Group*> slots_;  // open addressing, linear probing; owned groups
+    std::vector<Group*> slots_;  // open addressing, linear probing, into pool_
+    std::deque<Group> pool_;      // never moves a group; freed ones are reused
+    std::vector<Group*> free_;
     size_t used_ = 0;
+    // Each member's group, made when first needed: a file that is read and
+    // not edited never needs it.
     PointerMap<Group*> groupOf_;
+    bool groupOfBuilt_ = false;
+    void ensureGroupOf();
+    size_t memberCount() const;
     std::vector<Candidate> candidates_;  // a min-heap on `at`
     std::vector<PyObject*> released_;    // owned, dropped by flushReleases
 };

@@ -82,6 +82,7 @@ namespace sbc {
     X(Object, scopesSeen, "_fScopesSeen", dict)
 
 class DefIndex;
+struct DefinedName;
 struct NativePass;
 
 struct FinderState {
@@ -242,6 +243,14 @@ Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logical, Py_ssize_
 py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i);
 
 // Internal steps, not visible to Python.
+// _ProcessDedentedComments in two halves: where the run from `first` ends
+// (the following logical: the first code line after it, or the list's
+// length when none), and the placement of its members. A run with no code
+// after it is placed as if a module-level line followed. `knownBase`, when
+// given, is the following logical's containing scope as the caller already
+// knows it (the whole-list pass, from its stack).
+Py_ssize_t CommentRunEnd(PyObject* self, Py_ssize_t first);
+Py_ssize_t PlaceCommentRun(PyObject* self, Py_ssize_t first, Py_ssize_t end, const py::Ref* knownBase);
 // The native pass's way with the commonest edit, a code line replaced by
 // another at the same place (typing): the steps' own work for it, without
 // their general machinery. False, having done nothing, for any other edit.
@@ -251,7 +260,9 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedI
 void UpdateScopesSeen(PyObject* self, Py_ssize_t end);
 // The whole-list pass's count of the definition at `at`: the definition
 // index when the pass has one, else UpdateScopesSeenWithStartScopeLogical.
-Py_ssize_t CountDefinition(PyObject* self, PyObject* logical, Py_ssize_t at, PyObject* scopeName);
+// `name`, when given, is the logical's defined name as already read.
+Py_ssize_t CountDefinition(PyObject* self, PyObject* logical, Py_ssize_t at, PyObject* scopeName,
+                           const DefinedName* name = nullptr);
 Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logical,
                                                  PyObject* scopeName, bool nameIsBare);
 }  // namespace finder

@@ -113,9 +113,14 @@ void repairQueuedBefore(PyObject* self, Py_ssize_t end) {
 
 // Counting one definition into the index, as the whole-list pass does; the
 // definition's place is `at`. -1 when the index cannot take it.
-Py_ssize_t countIntoIndex(DefIndex* index, PyObject* logical, Py_ssize_t at, PyObject* scopeName) {
+Py_ssize_t countIntoIndex(DefIndex* index, PyObject* logical, Py_ssize_t at, PyObject* scopeName,
+                          const DefinedName* known) {
     DefinedName name;
-    if (!readDefinedName(logical, &name)) return 0;
+    if (known != nullptr) {
+        name = *known;
+    } else if (!readDefinedName(logical, &name)) {
+        return 0;
+    }
     if (!PyString_CheckExact(scopeName) || !PyString_CheckExact(name.name)) return -1;
     return index->append(logical, at, scopeName, name);
 }
@@ -137,11 +142,12 @@ Py_ssize_t UpdateScopesSeenWithStartScopeLogical(PyObject* self, PyObject* logic
     return index;
 }
 
-Py_ssize_t CountDefinition(PyObject* self, PyObject* logical, Py_ssize_t at, PyObject* scopeName) {
+Py_ssize_t CountDefinition(PyObject* self, PyObject* logical, Py_ssize_t at, PyObject* scopeName,
+                           const DefinedName* name) {
     if (DefIndex* index = definitionIndex(self)) {
         const Py_ssize_t counted = neverRaises(
             unraisableContext(Step::UpdateScopesSeenWithStartScopeLogical), Py_ssize_t(0),
-            [&] { return countIntoIndex(index, logical, at, scopeName); });
+            [&] { return countIntoIndex(index, logical, at, scopeName, name); });
         if (counted >= 0) return counted;
         dropDefinitionIndex(self);
     }

@@ -32,7 +32,7 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
         !PyString_CheckExact(top)) {
         return false;
     }
-    const Py_ssize_t index = CountDefinition(self, logical.get(), i, top);
+    const Py_ssize_t index = CountDefinition(self, logical.get(), i, top, &name);
     py::Ref local;
     if (name.index == index) {
         local = py::Ref::own(name.name);
@@ -46,13 +46,12 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
     PyObject* old = scopeName(l);
     requireStrOrNone(old);
     if (old == Py_None || !strEquals(old, top)) setScopeName(l, top);
-    PyObject* set = l->fKind == kClassLogical ? s.classChanges : s.functionChanges;
-    if (!strEquals(name.name, local.get())) {
-        setLocalScopeDefined(l, local.get());
-        addChange(s.contentsChanges, top);
-        addChange(set, full->get());
-    }
-    addChange(set, full->get());
+    // _SetLogicalScopeNames records a new local name (the enclosing scope
+    // and this full name), and the pass then records this scope itself;
+    // the enclosing scope is in the set already, since it was recorded
+    // when it opened, so each name is added once.
+    if (!strEquals(name.name, local.get())) setLocalScopeDefined(l, local.get());
+    addChange(l->fKind == kClassLogical ? s.classChanges : s.functionChanges, full->get());
     addChange(s.contentsChanges, full->get());
     return true;
 }
@@ -69,6 +68,27 @@ void FindChangesEntireListAdded(PyObject* self) {
         LogicalRef logical = logicalAt(self, i);
         const int indent = logical->fIndent;
         if (isWhitespace(logical.record()) && indent <= stack.back().indent) {
+            if (nativePass(self)) {
+                // The step's own work, except that the following logical's
+                // scope is what this pass will give it: the stack's
+                // innermost scope opened by a line less indented than it
+                // (the look-back finds the same).
+                const Py_ssize_t next = neverRaises(
+                    unraisableContext(Step::ProcessDedentedComments), Py_ssize_t(0), [&]() -> Py_ssize_t {
+                        const Py_ssize_t end = CommentRunEnd(self, i);
+                        const py::Ref* known = nullptr;
+                        if (end < logicalListLength(self)) {
+                            const int following = logicalAt(self, end)->fIndent;
+                            size_t top = stack.size() - 1;
+                            while (top > 0 && following <= stack[top].indent) --top;
+                            if (following >= 0) known = &stack[top].name;
+                        }
+                        return PlaceCommentRun(self, i, end, known);
+                    });
+                requireRunPlaced(next, i);
+                i = next;
+                continue;
+            }
             const Py_ssize_t next = route::ProcessDedentedComments(self, i);
             requireRunPlaced(next, i);
             i = next;
