@@ -1,15 +1,11 @@
 """CScopeBodyCache: scope defs and bodies by full dotted name."""
 
-import os
-import sys
 import unittest
 
 from pysource.scopebodycache import CScopeBodyCache, GetFullNameForScopeDef
 
-from support import Logical, Named, Outcome, SANITIZED, kDefKind
-
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
-import crosscheck_bodies  # noqa: E402
+from support import SANITIZED, Logical, Named, Outcome, kDefKind
+import crosscheck_bodies  # tools/ is on the path through support
 
 kNested = """\
 class A:

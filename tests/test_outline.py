@@ -10,13 +10,12 @@ import tempfile
 import textwrap
 import types
 import unittest
-from cStringIO import StringIO
 
-kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
+from support import kRepoDir, TextBuffer
+import outline  # tools/ is on the path through support
+import progress
+
 kTool = os.path.join(kRepoDir, 'tools', 'outline.py')
-sys.path.insert(0, os.path.join(kRepoDir, 'tools'))
-import outline  # noqa: E402
-
 # The sanitized build is not in build/, where the tool looks by itself.
 kFindsBuildItself = not os.environ.get('SBC_SANITIZED') and os.path.exists(
     os.path.join(kRepoDir, 'build', 'python', 'pysource', 'scopebodycache.so'))
@@ -25,7 +24,7 @@ kFindsBuildItself = not os.environ.get('SBC_SANITIZED') and os.path.exists(
 def Main(*args):
     """(exit status, stdout, stderr) of outline.main(args)."""
     saved = sys.stdout, sys.stderr
-    sys.stdout, sys.stderr = out, err = StringIO(), StringIO()
+    sys.stdout, sys.stderr = out, err = TextBuffer(), TextBuffer()
     try:
         status = outline.main(list(args))
     finally:
@@ -47,12 +46,15 @@ def OutlineRows(out):
 
 class SampleTest(unittest.TestCase):
 
-    def testRunAsAScriptOutlinesTheSample(self):
+    def Run(self, *args):
         env = dict(os.environ)
         if kFindsBuildItself:
             env.pop('PYTHONPATH', None)
-        proc = subprocess.Popen([sys.executable, kTool], env=env, cwd='/',
-                                stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+        return subprocess.Popen([sys.executable, kTool] + list(args), env=env, cwd='/',
+                                stdout=subprocess.PIPE, stderr=subprocess.PIPE, universal_newlines=True)
+
+    def testRunAsAScriptOutlinesTheSample(self):
+        proc = self.Run()
         out, err = proc.communicate()
         self.assertEqual((0, ''), (proc.returncode, err))
         self.assertIn('outline_sample.py', out.splitlines()[0])
@@ -69,6 +71,12 @@ class SampleTest(unittest.TestCase):
         self.assertTrue(any(r[3].endswith('#2') for r in rows))
         self.assertGreaterEqual(max(r[1] for r in rows), 2)
         self.assertTrue(any(r[2] == 'class' and r[1] >= 1 for r in rows))
+
+    def testReaderThatStopsEarlyEndsItQuietly(self):
+        proc = self.Run('--logicals')
+        proc.stdout.close()  # before the tool has written anything
+        self.assertEqual(proc.stderr.read(), '')
+        proc.wait()
 
 
 class FileTest(unittest.TestCase):
@@ -190,6 +198,23 @@ class ReplayOptionTest(unittest.TestCase):
         finally:
             sys.modules['replay'] = saved
         self.assertEqual([['a.py', '--scope', 'x']], calls)
+
+
+class ProgressTest(unittest.TestCase):
+
+    def testShownOnATerminalOnly(self):
+        for isatty in False, True:
+            stream = TextBuffer()
+            stream.isatty = lambda: isatty
+            with progress.Progress(3, 'files', stream) as shown:
+                shown.kInterval = 0
+                for k in range(3):
+                    shown.Step(note='%d edits' % k)
+            lines = stream.getvalue().split('\r')
+            self.assertEqual(lines[1:3] if isatty else lines, ['1/3 files, 0 edits, 0s elapsed, about 0s left',
+                                                              '2/3 files, 1 edits, 0s elapsed, about 0s left']
+                             if isatty else [''])
+            self.assertEqual(lines[-1], '')
 
 
 if __name__ == '__main__':
