@@ -144,7 +144,7 @@ class DriverTest(unittest.TestCase):
         self.assertEqual(finder.calls, ['prepare', 'removed', 'added', 'clear'])
         indices = finder.seen[1]
         self.assertIs(type(indices), list)
-        self.assertEqual(map(id, finder.seen), map(id, [removed, indices, added, indices]))
+        self.assertEqual([id(x) for x in finder.seen], [id(x) for x in (removed, indices, added, indices)])
         # They must be a list or None; the whole-list pass ignores them.
         finder.removed_result, finder.calls = (), []
         self.assertEqual(Outcome(finder.FindChanges, [], []), (TypeError, 'Expected list, got tuple'))
