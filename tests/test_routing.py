@@ -109,8 +109,14 @@ class NeverRaisingStepTest(unittest.TestCase):
             self.assertEqual(finder._ProcessDedentedComments(len(lst) + 10), len(lst) if OPTIMIZED else 0)
             # Outside a find there is no scopes-seen table to consult.
             self.assertEqual(finder._FindScopeIndexForLogical(lst[0], 0), 0)
+            # Asked below the end of the table: refused, or, optimised, counted from the whole table.
+            finder._PrepareForFind()
+            finder._FindScopeIndexForLogical(lst[8], 8)
+            self.assertEqual(finder._FindScopeIndexForLogical(lst[0], 0), 1 if OPTIMIZED else 0)
+            finder._Clear()
         for step in ['_FindScopeIndexForLogical'] + ['_ProcessDedentedComments'] * (not OPTIMIZED):
             self.assertIn(kContext + step, err.getvalue())
+        self.assertEqual(err.getvalue().count(kContext + '_FindScopeIndexForLogical'), 1 + (not OPTIMIZED))
 
 
 class GlobalsLookedUpAtUseTest(unittest.TestCase):

@@ -18,6 +18,11 @@ class HandBuiltListTest(unittest.TestCase):
         self.assertEqual(ScopeNames(lst), ['', 'f#0', 'f#0', 'f#0', 'f#0', ''])
         self.assertEqual(Names(Named('async def f():\n    pass\n')), [('', 'f#0'), ('f#0', None)])
 
+    def testNegativeIndentWouldCloseTheModuleScope(self):
+        # Optimised, the assert before closing is skipped and the empty stack has no top.
+        self.assertEqual(Outcome(WholePass, [Code(1, -1)]),
+                         (IndexError, 'list index out of range') if OPTIMIZED else (AssertionError, ''))
+
     def testStaleIndicesAreCountedAfresh(self):
         lst = [Def(1, 0, 'f'), Def(2, 0, 'f')]
         lst[0].fLocalScopeName = lst[1].fLocalScopeName = 'f#5'
