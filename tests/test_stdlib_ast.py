@@ -58,16 +58,6 @@ kSources = [
         '''), {1: ('', None), 2: ('', 'A#0'), 3: ('A#0', None), 4: ('A#0', 'B#0'), 5: ('A#0.B#0', 'm#0'),
                6: ('A#0.B#0.m#0', 'inner#0'), 7: ('A#0.B#0.m#0.inner#0', None), 8: ('A#0.B#0.m#0', None),
                9: ('A#0', None), 10: ('', None)}),
-    (D('''\
-        def f(): return 1
-        def g():
-            if x: return 2
-            for i in y:
-                pass
-            else:
-                pass
-        class C: pass
-        '''), {1: '', 2: '', 3: 'g#0', 4: 'g#0', 5: 'g#0', 6: 'g#0', 7: 'g#0', 8: ''}),
     # Clause headers stay in the statement's scope.
     (D('''\
         def f():
@@ -102,15 +92,6 @@ kSources = [
                7: ('A#0', 'f#2'), 8: ('', 'f#1'), 9: ('', 'f#2')}),
     ('class X: pass\ndef X(): pass\nclass X:\n    def X(self): pass\n    class X: pass\n',
      {1: ('', 'X#0'), 2: ('', 'X#1'), 3: ('', 'X#2'), 4: ('X#2', 'X#0'), 5: ('X#2', 'X#1')}),
-    (D('''\
-        class P(object):
-            @property
-            def v(self):
-                return self._v
-            @v.setter
-            def v(self, value):
-                self._v = value
-        '''), {1: '', 2: 'P#0', 3: ('P#0', 'v#0'), 4: 'P#0.v#0', 5: 'P#0', 6: ('P#0', 'v#1'), 7: 'P#0.v#1'}),
     (D('''\
         class A:
             @one
