@@ -55,8 +55,8 @@ def Plain(value):
 
 def Fields(obj):
     r = obj.__reduce__()
-    state = r[2] if len(r) > 2 else r[1][2]
-    return Plain((obj.IsDestroyed(), getattr(obj, '__fSignalCatchers'), obj._fLogicalList) + state[2:])
+    return Plain((obj.IsDestroyed(), getattr(obj, '__fSignalCatchers'), obj._fLogicalList) +
+                 (r[2] if len(r) > 2 else r[1][2])[2:])
 
 
 class SnapshotFinder(CChangeFinder):
@@ -136,7 +136,6 @@ class ReduceFormTest(unittest.TestCase):
         self.assertEqual(cf.__reduce__()[2], state)
 
     def testRebuildFunctionsByNameLookedUpAtEachReduce(self):
-        self.assertIs(pickle.loads(pickle.dumps(UnpickleFinder)), UnpickleFinder)
         self.assertIn('scopebodycache\n__pyx_unpickle_CChangeFinder', pickle.dumps(CChangeFinder(None), 0))
         marker = lambda *args: None  # noqa: E731
         setattr(scopebodycache, '__pyx_unpickle_CScopeBodyCache', marker)
@@ -144,10 +143,6 @@ class ReduceFormTest(unittest.TestCase):
             self.assertIs(CScopeBodyCache(None).__reduce__()[0], marker)
         finally:
             setattr(scopebodycache, '__pyx_unpickle_CScopeBodyCache', UnpickleCache)
-        self.assertIs(CScopeBodyCache(None).__reduce__()[0], UnpickleCache)
-        for cls in (CChangeFinder, CScopeBodyCache):
-            self.assertNotIn('__reduce_ex__', cls.__dict__)
-            self.assertFalse(hasattr(cls, '__getstate__'))
 
 
 class RefusedTest(unittest.TestCase):
@@ -192,14 +187,11 @@ class RefusedTest(unittest.TestCase):
         self.assertRaises(TypeError, c.__setstate__, (1, {'s': 1}, lst, 'bad', {}))
         self.assertEqual(c.__reduce__()[2], (True, {'s': 1}, lst, {}, {}))  # earlier fields kept
         self.assertIs(c._fLogicalList, lst)
-        full = (True, {}, set(['x']), set(), set(), 3, 4, [], 5, {})
-        for n in range(10):
-            cf = CChangeFinder(None)
-            self.assertEqual(Outcome(cf.__setstate__, full[:n]), (IndexError, 'tuple index out of range'))
-            self.assertEqual(cf.IsDestroyed(), n > 0)
-        c.__setstate__(([1], None, None, None, None))
-        self.assertTrue(c.IsDestroyed())
-        c.__setstate__((False, None, None, None, None, {'x': 1}, 'ignored'))  # no __dict__: ignored
+        cf = CChangeFinder(None)
+        self.assertEqual(Outcome(cf.__setstate__, (True, {}, set(['x']))), (IndexError, 'tuple index out of range'))
+        self.assertTrue(cf.IsDestroyed())
+        c.__setstate__(([], None, None, None, None, {'x': 1}, 'ignored'))  # no __dict__: ignored
+        self.assertFalse(c.IsDestroyed())
         sub = SubCache(None)
         sub.__setstate__((False, None, None, None, None, {'x': 1}, 'ignored'))
         self.assertEqual(sub.x, 1)
