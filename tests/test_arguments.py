@@ -72,42 +72,24 @@ class ArgumentTest(unittest.TestCase):
     def testParametersByKeyword(self):
         lst = Read('class A:\n    pass\n')
         finder = CChangeFinder(logical_list=lst)
-        self.assertIs(finder._fLogicalList, lst)
         self.assertEqual(finder.FindChanges(removed_list=[], added_list=lst)[1], set(['A#0']))
         self.assertEqual(finder.FindChanges(lst, removed_list=[])[1], set(['A#0']))
-        l = Logical(['def', 'g'], kind=kDefKind)
-        self.assertIsNone(sbc.SetLogicalLocalScopeDefined(name='g#4', logical=l))
-        self.assertEqual(l.fLocalScopeName, 'g#4')
-        s = set([1])
-        self.assertTrue(sbc.PySet_InplaceOr(to_add=set([2]), set_obj=s))
-        self.assertEqual(s, set([1, 2]))
-        self.finder._PrepareForFind()
-        try:
-            self.finder._LogicalInScopeChanged(self.lst[1], 'f#0', old_leaf_scope=None)
-            self.finder._LogicalInScopeChanged(scope_name='f#0', logical=self.lst[1],
-                                               old_containing_scope=None)
-        finally:
-            self.finder._Clear()
+        l, s = Logical(['def', 'g'], kind=kDefKind), set([1])
+        sbc.SetLogicalLocalScopeDefined(name='g#4', logical=l)
+        self.assertEqual((l.fLocalScopeName, sbc.PySet_InplaceOr(to_add=set([2]), set_obj=s)), ('g#4', True))
+        finder._PrepareForFind()
+        finder._LogicalInScopeChanged(scope_name='', logical=lst[1], old_containing_scope=None, old_leaf_scope=None)
+        finder._Clear()
 
     def testArgumentErrorsComeBeforeTheGuardAndAnyStep(self):
         calls = []
-
-        class Finder(CChangeFinder):
-            def _PrepareForFind(self):
-                calls.append('prepare')
-                CChangeFinder._PrepareForFind(self)
-
-        finder = Finder(self.lst)
-        self.assertRaises(TypeError, finder.FindChanges, [], ())
+        finder = type('Finder', (CChangeFinder,), {'_PrepareForFind': lambda s: calls.append(s)})(self.lst)
         self.assertRaises(TypeError, finder.FindChanges, [], [], bogus=1)
         self.assertEqual(calls, [])
-        finder._PrepareForFind()
-        try:
-            self.assertRaises(TypeError, finder.FindChanges, (), [])
-            self.assertRaises(TypeError, finder.FindChanges, [])
-            self.assertRaises(ValueError, finder.FindChanges, [], [])
-        finally:
-            finder._Clear()
+        CChangeFinder._PrepareForFind(finder)
+        # Busy, the finder refuses a call only once its arguments are right.
+        self.assertEqual([Outcome(finder.FindChanges, *args)[0] for args in [((), []), ([],), ([], [])]],
+                         [TypeError, TypeError, ValueError])
 
 
 if __name__ == '__main__':
