@@ -22,7 +22,6 @@ Exits 1 when any logical disagrees.
 import argparse
 import ast
 import bisect
-import os
 import random
 import sys
 
