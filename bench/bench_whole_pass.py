@@ -31,8 +31,8 @@ StdlibFiles = toolpath.StdlibFiles
 def ReadAll(paths):
     lists = []
     with Progress(len(paths), 'files read') as progress:
-        for path in paths:
-            progress.Step()
+        for done, path in enumerate(paths):
+            progress.Show(done)
             try:
                 with open(path, 'rU') as f:
                     lists.append(ReadLogicals(f.read(), path))

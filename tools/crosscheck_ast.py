@@ -275,8 +275,8 @@ def main(argv=None):
     files = skipped = logicals = 0
     found = []
     with Progress(len(paths)) as progress:
-        for path in paths:
-            progress.Step(note='%d disagreements' % len(found))
+        for done, path in enumerate(paths):
+            progress.Show(done, note='%d disagreements' % len(found))
             parsed = ParseBoth(path)
             if parsed is None:
                 skipped += 1

@@ -142,8 +142,8 @@ def CheckFiles(paths):
     """Totals over `paths`: dict of files, skipped, scopes, disagreements, details."""
     totals = {'files': 0, 'skipped': 0, 'scopes': 0, 'disagreements': 0, 'details': []}
     progress = Progress(len(paths))
-    for path in paths:
-        progress.Step(note='%d disagreements' % totals['disagreements'])
+    for done, path in enumerate(paths):
+        progress.Show(done, note='%d disagreements' % totals['disagreements'])
         with open(path, 'rb') as fp:
             source = fp.read()
         tree = Parse(source)

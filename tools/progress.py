@@ -28,7 +28,10 @@ class Progress(object):
         self._width = 0
 
     def Step(self, count=1, note=''):
-        self.done += count
+        self.Show(self.done + count, note)
+
+    def Show(self, done, note=''):
+        self.done = done
         now = time.time()
         if not self.shown or (now - self._drawn < self.kInterval and self.done < self.total):
             return

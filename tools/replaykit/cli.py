@@ -79,8 +79,8 @@ def RunReplay(paths, seed=0, edits_per_file=150, batch_fraction=0.15, cache_chec
     times, times_by_kind, sizes = [], {}, []
     repros = 0
     progress = Progress(len(paths))
-    for path in paths:
-        progress.Step(note='%d edits' % summary['edits'])
+    for done, path in enumerate(paths):
+        progress.Show(done, note='%d edits' % summary['edits'])
         try:
             with open(path, 'rU') as f:
                 original = JoinLines(SplitLines(f.read()))
