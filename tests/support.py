@@ -42,10 +42,6 @@ def Code(lineno, indent, *tokens):
     return Logical(tokens or ['x'], lineno, indent)
 
 
-def Comment(lineno, indent):
-    return Logical(['# c'], lineno, indent, kCommentKind)
-
-
 def Def(lineno, indent, name):
     return Logical(['def', name, '(', ')', ':'], lineno, indent, kDefKind)
 
@@ -122,19 +118,6 @@ def ModuleGlobal(module, name, value=kMissing):
         module.__dict__[name] = saved
 
 
-def RunPython(code):
-    """Runs `code` in a fresh interpreter with this environment and this
-    interpreter's -O: (status, stdout, stderr)."""
-    env = dict(os.environ)
-    env.setdefault('PYTHONPATH', os.pathsep.join(p for p in sys.path if p))
-    flags = ['-O'] if OPTIMIZED else []
-    proc = subprocess.Popen([sys.executable] + flags + ['-c', textwrap.dedent(code)],
-                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, env=env,
-                            universal_newlines=True)
-    out, err = proc.communicate()
-    return proc.returncode, out, err
-
-
 # Run in a fresh interpreter: `setup` puts substitutes for the sibling modules
 # (copies with a change) in sys.modules, then the module is imported.
 kImportPrelude = r'''
@@ -193,10 +176,14 @@ sys.stdout.write('RESULT %r\n' % (result,))
 
 
 def ImportWith(setup, after=''):
-    """Imports the module after `setup`, runs `after`; returns the child's `result` dict."""
-    status, out, err = RunPython(kImportPrelude.replace('#SETUP', textwrap.dedent(setup))
-                                 .replace('#AFTER', textwrap.dedent(after)))
+    """In a fresh interpreter with this one's path and -O, imports the module
+    after `setup` and runs `after`; returns the child's `result` dict."""
+    code = kImportPrelude.replace('#SETUP', textwrap.dedent(setup)).replace('#AFTER', textwrap.dedent(after))
+    env = dict(os.environ, PYTHONPATH=os.pathsep.join(p for p in sys.path if p))
+    proc = subprocess.Popen([sys.executable] + ['-O'] * OPTIMIZED + ['-c', code], env=env,
+                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, universal_newlines=True)
+    out, err = proc.communicate()
     lines = [l for l in out.splitlines() if l.startswith('RESULT ')]
-    if status != 0 or len(lines) != 1:
-        raise RuntimeError('the child failed: %r' % ((status, out, err),))
+    if proc.returncode != 0 or len(lines) != 1:
+        raise RuntimeError('the child failed: %r' % ((proc.returncode, out, err),))
     return ast.literal_eval(lines[0][len('RESULT '):])

@@ -2,8 +2,9 @@
 
 import unittest
 
-from support import (OPTIMIZED, CapturedStderr, CChangeFinder, Code, Comment, Def, FinderFields,
-                     Logical, Named, Names, Outcome, Read, ScopeNames, WholePass, kBlankKind)
+from support import (OPTIMIZED, CapturedStderr, CChangeFinder, Code, Def, FinderFields,
+                     Logical, Named, Names, Outcome, Read, ScopeNames, WholePass, kBlankKind,
+                     kCommentKind)
 
 
 class HandBuiltListTest(unittest.TestCase):
@@ -12,8 +13,8 @@ class HandBuiltListTest(unittest.TestCase):
         lst = [Def(1, 0, 'f'), Def(2, 0, 'g'), Code(3, 4)]
         WholePass(lst)
         self.assertEqual(ScopeNames(lst), ['', '', 'g#0'])
-        lst = [Def(1, 0, 'f'), Code(2, 4), Comment(3, 0), Logical([], 4, 0, kBlankKind), Code(5, 4),
-               Comment(6, 0)]
+        comment = lambda lineno: Logical(['# c'], lineno, 0, kCommentKind)  # noqa: E731
+        lst = [Def(1, 0, 'f'), Code(2, 4), comment(3), Logical([], 4, 0, kBlankKind), Code(5, 4), comment(6)]
         WholePass(lst)
         self.assertEqual(ScopeNames(lst), ['', 'f#0', 'f#0', 'f#0', 'f#0', ''])
         self.assertEqual(Names(Named('async def f():\n    pass\n')), [('', 'f#0'), ('f#0', None)])
