@@ -89,10 +89,6 @@ class ForwardScanTest(unittest.TestCase):
         self.assertEqual(ScopeNames(lst), ['', 'g#0', 'g#0', ''])
         self.assertEqual(result, (set(['', 'g#0']), set(), set(['g#0'])))
 
-    def testScanStopsAtAnAddedLogicalNotYetVisited(self):
-        new = "def g():\n    a = 1\n    c = 9\n    b = 2\n"
-        self.assertEqual(Names(Edited("def f():\n    a = 1\n    b = 2\n", new)[0]), WholeListNames(new))
-
     def testRenamedClassRenamesItsMethodsAndReportsOldNames(self):
         old = "class A:\n    def f(self):\n        pass\n    def g(self):\n        pass\n"
         lst, _, (contents, classes, functions) = Edited(old, old.replace('class A', 'class B'))
@@ -119,21 +115,6 @@ class IndexRepairTest(unittest.TestCase):
         self.assertEqual(Names(lst), [('', 'f#0'), ('f#0', None)])
         # The first header and the last body line are kept; the second def went.
         self.assertEqual((contents, functions), (set(['', 'f#0', 'f#1']), set(['f#1'])))
-
-    def testSeveralChangesInOneCall(self):
-        body = "".join("    x%d = %d\n" % (n, n) for n in range(6))
-        old = "def f():\n" + body + "def f():\n" + body
-        first = "def f():\n    pass\n" + old
-        lines = first.splitlines(True)
-        lines[-2] = "    changed = 1\n"
-        new = "".join(lines)
-        # Two changes, top first, as an editor reports them.
-        self.assertEqual(Names(Edited(old, first, new)[0]), WholeListNames(new))
-
-    def testPrefixRenameReachesPastCommentsInTheParent(self):
-        old = "def f():\n    x = 1\n# c\n        # deep\ny = 2\n"
-        new = "def f():\n    pass\n" + old
-        self.assertEqual(Names(Edited(old, new)[0]), WholeListNames(new))
 
 
 class OverrideTest(unittest.TestCase):

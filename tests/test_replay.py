@@ -160,6 +160,11 @@ kScenarios = [
     ('class A:\n    x = 1\n', 'class A:\n# note\n    x = 1\n'),
     ('def f():\n    x = 1\n# c\n    y = 2\nz = 3\n', 'def f():\n    x = 1\n# c\nz = 3\n'),
     ('def f():\n    x = 1\n', 'def f():\n    x = 1\n# end\n'),
+    # A forward scan stops at an added logical not visited yet; a rename
+    # reaches past comments that sit in the parent.
+    ('def f():\n    a = 1\n    b = 2\n', 'def g():\n    a = 1\n    c = 9\n    b = 2\n'),
+    ('def f():\n    x = 1\n# c\n        # deep\ny = 2\n',
+     'def f():\n    pass\ndef f():\n    x = 1\n# c\n        # deep\ny = 2\n'),
 ]
 # Several changes in one call.
 kBatchScenarios = [
