@@ -78,42 +78,22 @@ class LogicalTest(unittest.TestCase):
 
 class SmallFunctionsTest(unittest.TestCase):
 
-    def testSetInplaceOrReportsWhetherAnythingWasAdded(self):
+    def testSetInplaceOr(self):
         s = set([1, 2])
-        for to_add, added, size in [(set([2, 3]), True, 3), (frozenset([1, 3]), False, 3),
-                                    (set(), False, 3), (MySet([4]), True, 4), (s, False, 4)]:
+        for to_add, added in [(set([2, 3]), True), (frozenset([1, 3]), False), (MySet([4]), True), (s, False)]:
             self.assertIs(PySet_InplaceOr(s, to_add), added, to_add)
-            self.assertEqual(len(s), size)
         self.assertEqual(s, set([1, 2, 3, 4]))
-
-    def testSetInplaceOrErrors(self):
-        def Other(result):  # set |= x falls back to x.__ror__, whose result is checked
-            return type('Other', (object,), {'__ror__': lambda self, other: result})()
-
-        def OperatorError(to_add):
-            try:
-                probe = set()
-                probe |= to_add
-            except TypeError as e:
-                return TypeError, str(e)
-
-        def Wrong(name):
-            return TypeError, "Argument 'set_obj' has incorrect type (expected set, got %s)" % name
-
+        # set |= x falls back to x.__ror__, whose result must be a set; it is measured, not stored.
+        other = lambda result: type('Other', (object,), {'__ror__': lambda self, o: result})()  # noqa: E731
+        self.assertEqual([PySet_InplaceOr(s, other(set([5]))), PySet_InplaceOr(s, other(set('abcd')))], [True, False])
+        self.assertEqual(s, set([1, 2, 3, 4]))
+        wrong = "Argument 'set_obj' has incorrect type (expected set, got %s)"
         for set_obj, to_add, expected in [
                 (None, set([1]), (TypeError, "object of type 'NoneType' has no len()")),
-                (frozenset(), set([1]), Wrong('frozenset')), (MySet(), set([1]), Wrong('MySet')),
-                (set([9]), [1], OperatorError([1]))] + [
-                (set([9]), Other(r), (TypeError, 'Expected set, got ' + type(r).__name__))
-                for r in [[1], frozenset([1, 2]), MySet([1, 2])]]:
-            self.assertEqual(Outcome(PySet_InplaceOr, set_obj, to_add), expected, (set_obj, to_add))
-            if type(set_obj) is set:
-                self.assertEqual(set_obj, set([9]))
-        # A set result is measured against the original length, and not stored.
-        s = set([1])
-        self.assertIs(PySet_InplaceOr(s, Other(set([5, 6]))), True)
-        self.assertIs(PySet_InplaceOr(s, Other(set([5]))), False)
-        self.assertEqual(s, set([1]))
+                (frozenset(), set([1]), (TypeError, wrong % 'frozenset')), (MySet(), s, (TypeError, wrong % 'MySet')),
+                (s, other(MySet([1])), (TypeError, 'Expected set, got MySet'))]:
+            self.assertEqual(Outcome(PySet_InplaceOr, set_obj, to_add), expected)
+        self.assertRaises(TypeError, PySet_InplaceOr, s, [1])  # the operator's own error
 
     def testNowAndOutOfTime(self):
         before, now, after = time.time(), GetNowTime(), time.time()
