@@ -6,7 +6,7 @@ import pysource.symbolinfo as symbolinfo
 from pysource._fastaccess import LogicalLineType
 from pysource.scopebodycache import GetFullNameForScopeDef
 
-from support import OPTIMIZED, Logical, Named, Outcome, kClassKind, kCommentKind, kDefKind
+from support import OPTIMIZED, Logical, Outcome, kClassKind, kCommentKind, kDefKind
 
 Join = symbolinfo.JoinTwoScopeNames
 
@@ -47,20 +47,6 @@ class FullNameTest(unittest.TestCase):
             self.assertEqual(got, expected, scope_def)
             if isinstance(got, str):
                 self.assertIs(type(got), str)
-
-    def testMatchesTheNamesOfAWholeListPass(self):
-        lst = Named('''\
-            class A:
-                def f(self):
-                    pass
-                def f(self):
-                    class B:
-                        x = 1
-            ''')
-        for scope_def, next_logical in zip(lst, lst[1:]):
-            if scope_def.fKind in (kClassKind, kDefKind):
-                self.assertEqual(GetFullNameForScopeDef(scope_def), next_logical.fScopeName)
-        self.assertEqual(GetFullNameForScopeDef(lst[4]), Join('A#0.f#1', 'B#0'))
 
 
 if __name__ == '__main__':

@@ -3,7 +3,7 @@ carried, and that every edit leaves the names a fresh whole-file pass gives."""
 
 import unittest
 
-from support import (OPTIMIZED, CapturedStderr, CChangeFinder, Code, Edit, FinderFields, Named,
+from support import (OPTIMIZED, CChangeFinder, Code, Edit, FinderFields, Named,
                      Names, Outcome, Read, ScopeNames, WholeListNames, WholePass)
 
 
@@ -143,18 +143,6 @@ class OverrideTest(unittest.TestCase):
                          (IndexError, 'list index out of range'))
         outcome = self.Edit(_FindScopeNameContainingLogical=lambda self, i: self._destroy_impl() or '')[2]
         self.assertIn(outcome[0], (TypeError, AttributeError))
-
-    def testScopeIndexOverrideFailureIsReportedAndCountsAsZero(self):
-        def Raise(self, logical, i):
-            raise KeyError('idx')
-
-        lst = Read('x = 1\n')
-        finder = type('Bad', (CChangeFinder,), {'_FindScopeIndexForLogical': Raise})(lst)
-        finder.FindChanges(lst, [])
-        with CapturedStderr() as err:
-            finder.FindChanges(*Edit(lst, 'x = 1\ndef g(): pass\n'))
-        self.assertEqual(lst[1].fLocalScopeName, 'g#0')
-        self.assertIn('pysource.scopebodycache.CChangeFinder._FindScopeIndexForLogical', err.getvalue())
 
     def testAddedLogicalMissingFromTheList(self):
         lst = Named('x = 1\ny = 2\n')

@@ -101,7 +101,9 @@ class NeverRaisingStepTest(unittest.TestCase):
         with CapturedStderr() as err:
             lst, finder = Prepared(Subclass(_FindScopeIndexForLogical=lambda *args: 'x'))
             finder.FindChanges(*Edit(lst, kNewDef))
+        # Reported, and counted as index 0.
         self.assertIn(kContext + '_FindScopeIndexForLogical', err.getvalue())
+        self.assertEqual(lst[0].fLocalScopeName, 'f#0')
         lst, finder = Prepared()
         with CapturedStderr() as err:
             # Optimised, nothing checks the index: the scan past the end finds

@@ -6,7 +6,7 @@ import os
 import unittest
 from textwrap import dedent as D
 
-from support import SANITIZED, Logical, Named, ReadLogicals, WholePass
+from support import SANITIZED, Named, ReadLogicals, WholePass
 import crosscheck_ast  # tools/ is on the path through support
 
 kBigFiles = ['decimal.py', 'inspect.py', 'pydoc.py', os.path.join('test', 'test_descr.py')]
@@ -155,14 +155,6 @@ class HandWrittenSourcesTest(unittest.TestCase):
                 self.assertEqual(got[lineno] if isinstance(want, tuple) else got[lineno][0], want,
                                  'source %d, line %d' % (i, lineno))
             self.assertEqual([], crosscheck_ast.CheckSource(source, whitespace=True)[1], i)
-
-    def testNamelessDefOpensNoScope(self):
-        lst = [Logical(tokens, n, indent, kind) for n, (tokens, indent, kind) in enumerate([
-            (['class', 'A', ':'], 0, 1), (['def'], 4, 2), (['x', '=', '1'], 8, 0),
-            (['def', 'g', '(', ')', ':'], 4, 2), (['y'], 8, 0), (['def'], 0, 2), (['z'], 4, 0)], 1)]
-        WholePass(lst)
-        self.assertEqual(['', 'A#0', 'A#0', 'A#0', 'A#0.g#0', '', ''], [l.fScopeName for l in lst])
-        self.assertEqual('g#0', lst[3].fLocalScopeName)
 
 
 if __name__ == '__main__':

@@ -31,10 +31,13 @@ class HandBuiltListTest(unittest.TestCase):
         self.assertEqual([l.fLocalScopeName for l in lst], ['f#0', 'f#1'])
 
     def testNamelessDefinitionOpensNoScopeAndReportsNothing(self):
-        lst = [Logical(['def'], 1, 0, 2), Code(2, 4)]
+        lst = [Logical(tokens, n, indent, kind) for n, (tokens, indent, kind) in enumerate([
+            (['class', 'A', ':'], 0, 1), (['def'], 4, 2), (['x', '=', '1'], 8, 0),
+            (['def', 'g', '(', ')', ':'], 4, 2), (['y'], 8, 0), (['def'], 0, 2), (['z'], 4, 0)], 1)]
         with CapturedStderr() as err:
             WholePass(lst)
-        self.assertEqual((ScopeNames(lst), err.getvalue()), (['', ''], ''))
+        self.assertEqual((ScopeNames(lst), err.getvalue()), (['', 'A#0', 'A#0', 'A#0', 'A#0.g#0', '', ''], ''))
+        self.assertEqual(lst[3].fLocalScopeName, 'g#0')
 
 
 class ChangeSetTest(unittest.TestCase):
