@@ -58,6 +58,17 @@ class VisitingOrderTest(unittest.TestCase):
         lst = Named("x = 1\ny = 2\n")
         self.assertEqual(CChangeFinder(lst).FindChanges([], [lst[1]]), (set(['']), set(), set()))
 
+    def testLookBackStopsAtTheFirstLineNotDeeper(self):
+        # An unnamed line above the sibling is not reached: the sibling decides.
+        def Find(self, i):
+            del self._fLogicalList[1].fScopeName
+            return CChangeFinder._FindScopeNameContainingLogical(self, i)
+
+        old = "def f():\n    a = 1\n    b = 2\n    c = 3\n"
+        lst = Edited(old, old.replace('3', '4'),
+                     finder_class=type('F', (CChangeFinder,), {'_FindScopeNameContainingLogical': Find}))[0]
+        self.assertEqual(ScopeNames(lst), ['', None, 'f#0', 'f#0'])
+
     def testNextChangeAndLastProcessedIndices(self):
         old = "a = 1\nb = 2\nc = 3\nd = 4\ne = 5\n"
         first = old.replace('2', '20')
