@@ -23,8 +23,13 @@ import time
 _kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
 sys.path.insert(0, os.path.join(_kRepoDir, 'tools'))
 
-import replay  # noqa: E402  (imports the built packages)
-from replay import CChangeFinder, LogicalLineType, ReadLogicals  # noqa: E402
+import toolpath  # noqa: E402
+from progress import Progress  # noqa: E402
+from replaykit.checks import Names, WholePass  # noqa: E402  (imports the built packages)
+from replaykit.editor import Clone  # noqa: E402
+from pysource._fastaccess import LogicalLineType  # noqa: E402
+from pysource.logicals import ReadLogicals, kDefKind  # noqa: E402
+from pysource.scopebodycache import CChangeFinder  # noqa: E402
 
 kPlaces = (('start', 0.02), ('middle', 0.5), ('end', 0.98))
 kEdits = ('typing', 'insert def', 'remove def', 'comment', 'batch')
@@ -114,7 +119,7 @@ def IsBodyStatement(l):
 
 
 def IsMethodHeader(l):
-    return l.fKind == replay.kDefKind and l.fIndent == 4
+    return l.fKind == kDefKind and l.fIndent == 4
 
 
 def Typed(l):
@@ -166,7 +171,7 @@ def TimeDefLine(lst, call, at, reps):
     for _ in range(reps):
         ref = lst[i]
         header = LogicalLineType(('def', 'zz_bench', '(', 'self', ')', ':'), ref.fLineno,
-                                 ref.fIndent, replay.kDefKind)
+                                 ref.fIndent, kDefKind)
         cost_in, cost_out = InsertAndRemove(lst, i, header, call)
         inserted.append(cost_in)
         removed.append(cost_out)
@@ -217,11 +222,11 @@ def Median(values):
 
 
 def NamesAgree(lst):
-    fresh = replay.WholePass([replay.Clone(l) for l in lst])
-    return all(replay.Names(a) == replay.Names(b) for a, b in zip(lst, fresh))
+    fresh = WholePass([Clone(l) for l in lst])
+    return all(Names(a) == Names(b) for a, b in zip(lst, fresh))
 
 
-def Bench(size, reps):
+def Bench(size, reps, progress):
     text = Synthesise(size)
     lst = ReadLogicals(text)
     finder = CChangeFinder(lst)
@@ -241,6 +246,7 @@ def Bench(size, reps):
             'comment': Median(TimeComment(lst, call, at, reps)),
             'batch': Median(TimeBatch(lst, call, at, reps)),
         }
+        progress.Step()
     return len(lst), whole, rows, NamesAgree(lst)
 
 
@@ -253,8 +259,9 @@ def main(argv=None):
     sizes = [int(s) for s in args.sizes.split(',')]
 
     results = []
-    for size in sizes:
-        results.append(Bench(size, args.reps))
+    with Progress(len(sizes) * len(kPlaces), 'places') as progress:
+        for size in sizes:
+            results.append(Bench(size, args.reps, progress))
 
     print 'Median cost of one FindChanges call, microseconds (%d edits and %d undos each;' % (
         args.reps, args.reps)
@@ -284,4 +291,4 @@ def main(argv=None):
 
 
 if __name__ == '__main__':
-    sys.exit(main())
+    toolpath.RunMain(main)

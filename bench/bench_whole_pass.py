@@ -18,6 +18,7 @@ import time
 
 sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
 import toolpath  # noqa: E402
+from progress import Progress  # noqa: E402
 
 toolpath.setup()
 
@@ -29,12 +30,14 @@ StdlibFiles = toolpath.StdlibFiles
 
 def ReadAll(paths):
     lists = []
-    for path in paths:
-        try:
-            with open(path, 'rU') as f:
-                lists.append(ReadLogicals(f.read(), path))
-        except (SyntaxError, IOError):
-            pass
+    with Progress(len(paths), 'files read') as progress:
+        for done, path in enumerate(paths):
+            progress.Show(done)
+            try:
+                with open(path, 'rU') as f:
+                    lists.append(ReadLogicals(f.read(), path))
+            except (SyntaxError, IOError):
+                pass
     return lists
 
 
@@ -55,6 +58,12 @@ def TimeTouch(lists):
     return time.time() - start
 
 
+def Counted(count, progress):
+    for k in range(count):
+        yield k
+        progress.Step()
+
+
 def main(argv=None):
     parser = argparse.ArgumentParser(prog='bench_whole_pass.py')
     parser.add_argument('root', nargs='?', default=toolpath.StdlibDir(),
@@ -69,8 +78,9 @@ def main(argv=None):
         return 1
     gc.disable()  # collections would land in whichever loop triggers them
     try:
-        passes = min(TimePass(lists) for _ in range(args.repeat))
-        touches = min(TimeTouch(lists) for _ in range(args.repeat))
+        with Progress(2 * args.repeat, 'rounds') as progress:
+            passes = min(TimePass(lists) for _ in Counted(args.repeat, progress))
+            touches = min(TimeTouch(lists) for _ in Counted(args.repeat, progress))
     finally:
         gc.enable()
     rss = resource.getrusage(resource.RUSAGE_SELF).ru_maxrss / 1024.0  # KiB on Linux
@@ -86,4 +96,4 @@ def main(argv=None):
 
 
 if __name__ == '__main__':
-    sys.exit(main())
+    toolpath.RunMain(main)

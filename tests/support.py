@@ -1,19 +1,25 @@
-"""Helpers shared by the tests of pysource.scopebodycache."""
+"""Helpers shared by the suites of pysource.scopebodycache."""
 
 import ast
 import contextlib
+import io
 import os
 import subprocess
 import sys
 import textwrap
-from cStringIO import StringIO
 
-from pysource._fastaccess import LogicalLineType
-from pysource.logicals import ReadLogicals
-from pysource.scopebodycache import CChangeFinder
+kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
+# The tools are tested here, and the editor protocol is theirs.
+sys.path.insert(0, os.path.join(kRepoDir, 'tools'))
 
-kClassKind, kDefKind, kCommentKind, kBlankKind = 1, 2, 21, 22
+from pysource._fastaccess import LogicalLineType  # noqa: E402
+from pysource.logicals import ReadLogicals, kBlankKind, kClassKind, kCommentKind, kDefKind  # noqa: E402,F401
+from pysource.scopebodycache import CChangeFinder  # noqa: E402
+from replaykit.editor import Edit  # noqa: E402,F401
+
 SANITIZED = bool(os.environ.get('SBC_SANITIZED'))
+# Run with -O: the module's assertions are skipped too.
+OPTIMIZED = bool(sys.flags.optimize)
 kMissing = object()
 # A small file with a nested scope, a repeated name and a dedented comment.
 kSampleSource = '''\
@@ -32,14 +38,28 @@ def Logical(tokens, lineno=1, indent=0, kind=0):
     return LogicalLineType(list(tokens), lineno, indent, kind)
 
 
+def Code(lineno, indent, *tokens):
+    return Logical(tokens or ['x'], lineno, indent)
+
+
+def Def(lineno, indent, name):
+    return Logical(['def', name, '(', ')', ':'], lineno, indent, kDefKind)
+
+
 def Read(source):
     return ReadLogicals(textwrap.dedent(source))
+
+
+def WholePass(lst, finder_class=CChangeFinder):
+    """(finder, result) of a whole-list pass over `lst`."""
+    finder = finder_class(lst)
+    return finder, finder.FindChanges(lst, [])
 
 
 def Named(source):
     """The logicals of `source`, named by a fresh whole-list pass."""
     lst = Read(source)
-    CChangeFinder(lst).FindChanges(lst, [])
+    WholePass(lst)
     return lst
 
 
@@ -47,8 +67,20 @@ def Names(logicals):
     return [(l.fScopeName, l.fLocalScopeName) for l in logicals]
 
 
+def ScopeNames(logicals):
+    return [l.fScopeName for l in logicals]
+
+
 def WholeListNames(source):
     return Names(Named(source))
+
+
+def FinderFields(finder):
+    """The finder's fields by name, read through its pickled state."""
+    keys = ('destroyed', 'signal_catchers', 'class_changes', 'contents_changes',
+            'function_changes', 'end_index_for_scopes_seen', 'last_processed_index',
+            'logical_list', 'next_change_index', 'scopes_seen')
+    return dict(zip(keys, finder.__reduce__()[2]))
 
 
 def Outcome(func, *args, **kwargs):
@@ -59,31 +91,31 @@ def Outcome(func, *args, **kwargs):
         return type(e), e.args[0] if isinstance(e, KeyError) else str(e)
 
 
-def Edit(lst, new_source):
-    """Turns `lst` into the logicals of `new_source` as an editor would; returns (added, removed)."""
-    new = Read(new_source)
-    key = lambda l: (l.fTokens, l.fIndent, l.fKind)  # noqa: E731
-    limit = min(len(lst), len(new))
-    head = tail = 0
-    while head < limit and key(lst[head]) == key(new[head]):
-        head += 1
-    while tail < limit - head and key(lst[-1 - tail]) == key(new[-1 - tail]):
-        tail += 1
-    for k in range(1, tail + 1):
-        lst[-k].fLineno = new[-k].fLineno
-    removed, added = lst[head:len(lst) - tail], new[head:len(new) - tail]
-    lst[head:len(lst) - tail] = added
-    return added, removed
+def TextBuffer():
+    """A StringIO for what the interpreter writes as `str` (bytes on 2.x)."""
+    return io.BytesIO() if str is bytes else io.StringIO()
 
 
-def RunPython(code, *flags):
-    """Runs `code` in a fresh interpreter with this environment: (status, stdout, stderr)."""
-    env = dict(os.environ)
-    env.setdefault('PYTHONPATH', os.pathsep.join(p for p in sys.path if p))
-    proc = subprocess.Popen([sys.executable] + list(flags) + ['-c', textwrap.dedent(code)],
-                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, env=env)
-    out, err = proc.communicate()
-    return proc.returncode, out, err
+@contextlib.contextmanager
+def CapturedStderr():
+    """sys.stderr replaced by a buffer; unraisable reports land there."""
+    saved, sys.stderr = sys.stderr, TextBuffer()
+    try:
+        yield sys.stderr
+    finally:
+        sys.stderr = saved
+
+
+@contextlib.contextmanager
+def ModuleGlobal(module, name, value=kMissing):
+    """Rebinds (or, without a value, removes) a module global for the block."""
+    saved = module.__dict__.pop(name)
+    if value is not kMissing:
+        module.__dict__[name] = value
+    try:
+        yield
+    finally:
+        module.__dict__[name] = saved
 
 
 # Run in a fresh interpreter: `setup` puts substitutes for the sibling modules
@@ -119,7 +151,8 @@ def Substitute(real, drop_capi=(), capi={}, drop=(), **attrs):
 
 def Slotted(base_size, name='CDestroyable', **extra):
     count, rest = divmod(base_size - object.__basicsize__, ctypes.sizeof(ctypes.c_void_p))
-    assert rest == 0 and count >= 0, base_size
+    if rest or count < 0:
+        raise ValueError(base_size)
     extra['__slots__'] = tuple('s%d' % k for k in range(count))
     return type(name, (object,), extra)
 
@@ -143,31 +176,14 @@ sys.stdout.write('RESULT %r\n' % (result,))
 
 
 def ImportWith(setup, after=''):
-    """Imports the module after `setup`, runs `after`; returns the child's `result` dict."""
-    status, out, err = RunPython(kImportPrelude.replace('#SETUP', textwrap.dedent(setup))
-                                 .replace('#AFTER', textwrap.dedent(after)))
+    """In a fresh interpreter with this one's path and -O, imports the module
+    after `setup` and runs `after`; returns the child's `result` dict."""
+    code = kImportPrelude.replace('#SETUP', textwrap.dedent(setup)).replace('#AFTER', textwrap.dedent(after))
+    env = dict(os.environ, PYTHONPATH=os.pathsep.join(p for p in sys.path if p))
+    proc = subprocess.Popen([sys.executable] + ['-O'] * OPTIMIZED + ['-c', code], env=env,
+                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, universal_newlines=True)
+    out, err = proc.communicate()
     lines = [l for l in out.splitlines() if l.startswith('RESULT ')]
-    assert status == 0 and len(lines) == 1, (status, out, err)
+    if proc.returncode != 0 or len(lines) != 1:
+        raise RuntimeError('the child failed: %r' % ((proc.returncode, out, err),))
     return ast.literal_eval(lines[0][len('RESULT '):])
-
-
-@contextlib.contextmanager
-def CapturedStderr():
-    """sys.stderr replaced by a StringIO; unraisable reports land there."""
-    saved, sys.stderr = sys.stderr, StringIO()
-    try:
-        yield sys.stderr
-    finally:
-        sys.stderr = saved
-
-
-@contextlib.contextmanager
-def ModuleGlobal(module, name, value=kMissing):
-    """Rebinds (or, without a value, removes) a module global for the block."""
-    saved = module.__dict__.pop(name)
-    if value is not kMissing:
-        module.__dict__[name] = value
-    try:
-        yield
-    finally:
-        module.__dict__[name] = saved

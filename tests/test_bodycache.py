@@ -1,15 +1,11 @@
 """CScopeBodyCache: scope defs and bodies by full dotted name."""
 
-import os
-import sys
 import unittest
 
 from pysource.scopebodycache import CScopeBodyCache, GetFullNameForScopeDef
 
-from support import Logical, Named, Outcome, SANITIZED, kDefKind
-
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
-import crosscheck_bodies  # noqa: E402
+from support import SANITIZED, Logical, Named, Outcome, kDefKind
+import crosscheck_bodies  # tools/ is on the path through support
 
 kNested = """\
 class A:
@@ -100,9 +96,7 @@ class ResolutionTest(CacheTestCase):
                             ('A#0', [])]:
             self.assertEqual(Lines(cache.GetBodyOfScope(name)), lines, name)
         fresh = cache._FindBodyOfScopeDef(None)
-        self.assertEqual(fresh, cache.GetBodyOfScope(''))
-        self.assertIsNot(fresh, cache._FindBodyOfScopeDef(None))
-        self.assertIsNot(fresh, cache.GetBodyOfScope(''))
+        self.assertEqual((fresh, fresh is cache._FindBodyOfScopeDef(None)), (cache.GetBodyOfScope(''), False))
 
 
 class CacheTest(CacheTestCase):
@@ -134,9 +128,9 @@ class CacheTest(CacheTestCase):
         some = ['A#0', 'f#0']
         # Items after "*" are not looked at: len(5) would raise.
         for args, kwargs, left in [
-                ((), {}, []), (('*',), {}, []), (('a*',), {}, []), ((['f#0', '*', 5],), {}, []),
-                ((some + ['not cached', '**', '*x'],), {}, kept), ((tuple(some),), {}, kept),
-                ((iter(some),), {}, kept), ((dict.fromkeys(some),), {}, kept), ((), {'scope_names': some}, kept)]:
+                ((), {}, []), (('*',), {}, []), ((['f#0', '*', 5],), {}, []),
+                ((some + ['not cached', '**', '*x'],), {}, kept), ((iter(some),), {}, kept),
+                ((), {'scope_names': some}, kept)]:
             self.cache = CScopeBodyCache(self.lst)
             for name in ['A#0.f#0.g#0', 'f#1.B#0', 'f#0']:
                 self.cache.GetBodyOfScope(name)
@@ -157,14 +151,12 @@ class FailureTest(CacheTestCase):
         for exc, message, fn, args in [
                 (KeyError, missing % 'A#0.nope#0', c.GetBodyOfScope, ['A#0.nope#0']),
                 (KeyError, missing % 'A', c.GetScopeDef, ['A']),
-                (KeyError, missing % 'f#2', c._FindScopeDef, ['f#2']),
                 (ValueError, 'logical must start a scope: %r' % plain, c._FindBodyOfScopeDef, [plain]),
                 (TypeError, 'Argument must be a logical', c._FindBodyOfScopeDef, [3]),
                 (TypeError, "unhashable type: 'list'", c.GetBodyOfScope, [['x']]),
                 (TypeError, no_len % 'int', c.GetScopeDef, [5]),
                 (TypeError, 'Argument must be a logical', CScopeBodyCache([plain, 'x']).GetBodyOfScope, ['']),
                 (TypeError, no_len % 'NoneType', none.GetBodyOfScope, ['']),
-                (TypeError, no_len % 'NoneType', none._FindScopeDef, [None]),
                 (TypeError, 'Expected list, got tuple', CScopeBodyCache, [()])]:
             self.assertEqual(Outcome(fn, *args), (exc, message))
         self.assertEqual(self.Cached(), (['', 'A#0'], ['', 'A#0']))

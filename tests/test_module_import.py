@@ -1,10 +1,10 @@
 """The module's import: its namespace, its classes, and each way loading fails."""
 
 import __builtin__
+import difflib
 import gc
 import sys
 import unittest
-import zlib
 
 import pysource.symbolinfo
 import tallowkit
@@ -32,31 +32,83 @@ kMethods = {
     CScopeBodyCache: ['_destroy_impl', 'GetBodyOfScope', 'Clear', 'GetScopeDef', '_FindScopeDef',
                       '_FindBodyOfScopeDef'],
 }
-# Docstrings by qualified name: the text, or the CRC-32 of a long one; None for any other.
-kUpdateDoc, kFinder = 0x69b8065d, 'CChangeFinder.'
-kDocs = dict([(kFinder + n, d) for n, d in [
-    ('_Clear', " Clear everything but _fLogicalList "), ('_PrepareForFind', " Set up to find changes "),
-    ('_FindChangesEntireListAdded', " Find changes when the entire list has been added. "),
-    ('_FindScopeIndexForLogical', " Find the scope index for the given logical "),
-    ('_GetLeafScopeWithIndex', 0x5d11b15b), ('_ProcessRemovedLogicals', 0x446932f9),
-    ('_ProcessAddedLogicals', 0x15472779), ('_ProcessDedentedComments', 0xf39c470e),
-    ('_LogicalInScopeChanged', 0x3e234f79), ('_SetLogicalScopeNames', kUpdateDoc),
-    ('_UpdateLogicalScopeName', kUpdateDoc), ('_UpdateContainingScope', kUpdateDoc),
-    ('_PropagateScopeIndexChangeForward', 0x497c6c96), ('_FindScopeNameContainingLogical', 0x18ab0a97)]] + [
-    ('CChangeFinder', 0xb6d1a1ca), ('CScopeBodyCache._FindScopeDef', 0x58817988), ('PySet_InplaceOr', 0xd13df4f5),
-    ('DoubleValueForPyIntBits', 0x3d712d5d), ('OutOfTime', " Return whether now is past end time "),
-    ('GetNowTime', " Get the time value of now; equivalent to time.time() "),
-    ('DoubleValueForULongLongBits', " Returns double with the bit value of given unsigned long long "),
-    ('ULongLongValueForDoubleBits', " Returns the long long value with the same bit values as double ")])
+kUpdateDoc = (" Update the fScopeName and the fLocalScopeName (if applicable) for the\n"
+              "    logical if possible and return fScopeName if it succeeds.  Returns None\n"
+              "    and does not update anything if it fails.  Updates both names even if they\n"
+              "    are already set.  The i argument is the index of the logical in the logical\n"
+              "    list.  Succeeds if given a scope_name or if all logicals prior to this one\n"
+              "    have already been updated ")
+# The docstrings by qualified name; any other function or method has none.
+kDocs = {
+    'CChangeFinder': (
+        " Finds changes in logical list and updates fScopeName attribute on all\n"
+        "  logicals and the fLocalScopeName attribute on start scope logicals.  The\n"
+        "  fLocalScopeName attribute is updated with the scope index, which complicates\n"
+        "  things substantially.\n  \n"
+        "  Uses an optimized method is the list of added logicals == the _fLogicalList\n"
+        "  which is case when the file is first read of the contents are entirely replaced\n  \n"
+        "  If the added logicals != _fLogicalList, approach is to find an ordered list\n"
+        "  of indicies that may have changed.  This ordered list contains the indicies\n"
+        "  of all added logicals and the indicies of the logical following where each\n"
+        "  removed logical.  Once the ordered list is found, each index is visited \n"
+        "  in order to see if there are changes and to find scope names.\n  \n"
+        "  Often times there will be a small number of changes that won't change the\n"
+        "  scope structure -- think of a char types that translates into one logical\n"
+        "  removed and one logical added.  Containing scope is usually found by looking\n"
+        "  at prior logicals and finding one with an indent <= the indent of the logical\n"
+        "  in question.\n  \n"
+        "  Dedented comments are special cased and are given the scope of the logical\n"
+        "  following, if their indent <= the indent of the line above.  Otherwise,\n"
+        "  they're given the scope of the line above.\n  \n  \n  \n  "),
+    'CChangeFinder._Clear': " Clear everything but _fLogicalList ",
+    'CChangeFinder._PrepareForFind': " Set up to find changes ",
+    'CChangeFinder._FindChangesEntireListAdded': " Find changes when the entire list has been added. ",
+    'CChangeFinder._GetLeafScopeWithIndex': (" Get the leaf scope name with the given index.  Returns None if \n"
+                                             "    stack_index is -1 or logical is malformed "),
+    'CChangeFinder._ProcessRemovedLogicals': (
+        " Find changes from the list of logicals removed and return list of \n"
+        "    the indicies of the logical with the first lineno >= lineno removed.\n"
+        "    Does not update logical scope names. "),
+    'CChangeFinder._ProcessAddedLogicals': (
+        " Process all added logicals.  The indicies_to_check arg is a list of \n"
+        "    logicals that should be scanned for scope changes.  Note: not used\n    when whole file changes "),
+    'CChangeFinder._ProcessDedentedComments': (" Process the added commment.  Returns index of next non-comment\n"
+                                               "    logical "),
+    'CChangeFinder._LogicalInScopeChanged': (
+        " Record that the logical has changed.  The added argument indicates\n"
+        "    whether its been added to the list; if it hasn't been added, it has been\n    removed "),
+    'CChangeFinder._SetLogicalScopeNames': kUpdateDoc,
+    'CChangeFinder._UpdateLogicalScopeName': kUpdateDoc,
+    'CChangeFinder._UpdateContainingScope': kUpdateDoc,
+    'CChangeFinder._PropagateScopeIndexChangeForward': (
+        " Propagate change from old scope to new scope.  Only changes logicals\n"
+        "    whose containing scope starts with old scope "),
+    'CChangeFinder._FindScopeIndexForLogical': " Find the scope index for the given logical ",
+    'CChangeFinder._FindScopeNameContainingLogical': (
+        " Get the name of the scope given logical is in. Succeeds if all prior\n"
+        "    non whitespace have scope name set.  Returns None if the scope name\n    can't be found "),
+    'CScopeBodyCache._FindScopeDef': (
+        " Finds the scope def for the name without using the _fScopeDefCache\n"
+        "    for the name (this is used to find the value to put in the cache).\n"
+        "    Raises KeyError if scope isn't found "),
+    'PySet_InplaceOr': (" Performs a |= on the set object.  The to_add needs to be a set\n"
+                        "  or frozenset.  Returns if any items were added. "),
+    'GetNowTime': " Get the time value of now; equivalent to time.time() ",
+    'OutOfTime': " Return whether now is past end time ",
+    'DoubleValueForPyIntBits': (" Returns double with the bit value of given PyInt.  Needed because\n"
+                                "  passing a negative number to DoubleValueForULongLongBits raises an\n  exception "),
+    'DoubleValueForULongLongBits': " Returns double with the bit value of given unsigned long long ",
+    'ULongLongValueForDoubleBits': " Returns the long long value with the same bit values as double ",
+}
+
+
+def DocLines(docs):
+    """One line per docstring line, named, for a readable difference."""
+    return ['%s: %r' % (name, line) for name in sorted(docs)
+            for line in (docs[name].split('\n') if docs[name] is not None else [None])]
 
 
 class NamespaceTest(unittest.TestCase):
-
-    def assertDoc(self, name, obj):
-        expected, doc = kDocs.get(name), obj.__doc__
-        if isinstance(expected, (int, long)) and doc is not None:
-            doc = zlib.crc32(doc) & 0xffffffff
-        self.assertEqual(doc, expected, '%s has the docstring %r' % (name, obj.__doc__))
 
     def testSiblingModulesAreBoundAsModules(self):
         # The submodule, not the package that `import pysource._fastaccess` yields.
@@ -65,16 +117,25 @@ class NamespaceTest(unittest.TestCase):
         self.assertIs(sbc.tallowkit, tallowkit)
         self.assertIs(sbc.__builtins__, __builtin__)
 
+    def testDocstrings(self):
+        objects = dict((name, getattr(sbc, name)) for name in kFunctions)
+        for cls, names in kMethods.items():
+            objects[cls.__name__] = cls
+            objects.update((cls.__name__ + '.' + name, getattr(cls, name))
+                           for name in names + ['__reduce__', '__setstate__'])
+        got = DocLines(dict((name, obj.__doc__) for name, obj in objects.items()))
+        want = DocLines(dict((name, kDocs.get(name)) for name in objects))
+        self.assertTrue(got == want, 'docstrings differ:\n' + '\n'.join(
+            difflib.unified_diff(want, got, 'expected', 'actual', lineterm='')))
+
     def testFunctions(self):
         for name, module in sorted(kFunctions.items()):
             func = getattr(sbc, name)
             self.assertEqual((func.__name__, func.__module__), (name, module))
-            self.assertDoc(name, func)
 
     def testClassesAndMethods(self):
         for cls, names in kMethods.items():
             self.assertEqual((cls.__module__, cls.__base__), (kModule, CDestroyable))
-            self.assertDoc(cls.__name__, cls)
             self.assertTrue(gc.is_tracked(cls([])))
             self.assertIn('__init__', cls.__dict__)
             for name in names + ['__reduce__', '__setstate__']:
@@ -83,7 +144,6 @@ class NamespaceTest(unittest.TestCase):
                 method = getattr(cls, name)
                 self.assertEqual((method.__name__, method.__qualname__, method.__module__),
                                  (name, qualname, kModule))
-                self.assertDoc(qualname, method)
                 # Taken from the class dict, a method can be handed any object.
                 self.assertEqual(Outcome(cls.__dict__[name], object()), (TypeError, "descriptor '%s' requires a "
                                  "'%s.%s' object but received a 'object'" % (name, kModule, cls.__name__)))
@@ -125,14 +185,9 @@ kFailures = [
     ("Substitute(SI, drop_capi=['JoinTwoScopeNames'])", 'ImportError',
      'pysource.symbolinfo does not export expected C function JoinTwoScopeNames',
      ['CScopeBodyCache', 'CChangeFinder'], ['tallowkit', '_fastaccess', 'symbolinfo', 'GetFullNameForScopeDef']),
-    ("Substitute(SI, drop_capi=['AppendScopeSuffixes'])", 'ImportError',
-     'pysource.symbolinfo does not export expected C function AppendScopeSuffixes'),
     ("v['e'] = Signature(FA, 'LogicalLineType')\n"
      "Substitute(FA, capi={'LogicalLineType': Capsule(v['e'] + ' const')})", 'TypeError',
      'C variable pysource._fastaccess.LogicalLineType has wrong signature (expected %(e)s, got %(e)s const)'),
-    ("v['e'], v['g'] = Signature(SI, 'kFunctionKind'), Signature(SI, 'kFunctionPrefix')\n"
-     "Substitute(SI, capi={'kFunctionKind': Capsule(v['g'])})", 'TypeError',
-     'C variable pysource.symbolinfo.kFunctionKind has wrong signature (expected %(e)s, got %(g)s)'),
     ("v['e'], v['g'] = Signature(SI, 'JoinTwoScopeNames'), Signature(SI, 'SplitScopeNames')\n"
      "Substitute(SI, capi={'JoinTwoScopeNames': Capsule(v['g'])})", 'TypeError',
      'C function pysource.symbolinfo.JoinTwoScopeNames has wrong signature (expected %(e)s, got %(g)s)'),
@@ -140,17 +195,10 @@ kFailures = [
     ("Substitute(TD, CDestroyable=lambda: None)", 'TypeError',
      'tallowkit.destroyable.CDestroyable is not a type object', [], ['CScopeBodyCache', 'CChangeFinder']),
     ("Substitute(TD, drop=['CDestroyable'])", 'AttributeError', "'module' object has no attribute 'CDestroyable'"),
-    ("Substitute(SI, CDefInfo='x')", 'TypeError', 'pysource.symbolinfo.CDefInfo is not a type object'),
-    ("Substitute(TD, drop=['_CEmissionStackItem'])", 'AttributeError',
-     "'module' object has no attribute '_CEmissionStackItem'"),
     (kSmaller % 'TD.CDestroyable' + "Substitute(TD, CDestroyable=Slotted(v['got']))",
      'ValueError', kSizeMessage % 'tallowkit.destroyable.CDestroyable', [], ['CChangeFinder']),
-    (kSmaller % 'FA.CBytesTokenizer' + "Substitute(FA, CBytesTokenizer=Slotted(v['got'], 'CBytesTokenizer'))",
-     'ValueError', kSizeMessage % 'pysource._fastaccess.CBytesTokenizer'),
     # The right size but no native method table.
     ("Substitute(TD, CDestroyable=Slotted(TD.CDestroyable.__basicsize__))", 'RuntimeError',
-     'invalid vtable found for imported type'),
-    ("Substitute(SI, CSingleResolvedInfo=Slotted(SI.CSingleResolvedInfo.__basicsize__))", 'RuntimeError',
      'invalid vtable found for imported type'),
     ("import __builtin__; del __builtin__.enumerate", 'NameError', "name 'enumerate' is not defined", [],
      ['CScopeBodyCache']),

@@ -1,21 +1,21 @@
-"""Edits replayed through CChangeFinder agree with a fresh whole-file pass."""
+"""The editor protocol, and edits replayed through CChangeFinder agreeing
+with a fresh whole-file pass."""
 
 import os
+import subprocess
 import sys
 import tempfile
 import unittest
 
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
-import replay  # noqa: E402
-from replay import CChangeFinder, LiveDocument, Splice  # noqa: E402
-
-SANITIZED = bool(os.environ.get('SBC_SANITIZED'))
+from support import SANITIZED, CChangeFinder, Read, kDefKind
+from replaykit import checks, cli, editor, repro  # tools/ is on the path through support
+from replaykit.editor import ReadSteps, Splice
 
 
 def Edit(text, splices, cache_check=False, finder_class=CChangeFinder):
-    doc = LiveDocument(text, cache_check, finder_class)
+    doc = checks.LiveDocument(text, cache_check, finder_class)
     before = list(doc.lst)
-    return doc, before, doc.Edit(splices, replay.ReadSteps(doc.lines, splices))
+    return doc, before, doc.Edit(splices, ReadSteps(doc.lines, splices))
 
 
 class LazyFinder(object):
@@ -25,7 +25,7 @@ class LazyFinder(object):
         self.lst, self.real = lst, CChangeFinder(lst)
 
     def FindChanges(self, added, removed):
-        if len(added) != len(self.lst) and any(l.fKind == replay.kDefKind for l in added):
+        if len(added) != len(self.lst) and any(l.fKind == kDefKind for l in added):
             return set(), set(), set()
         return self.real.FindChanges(added, removed)
 
@@ -40,21 +40,34 @@ class ForgetfulFinder(LazyFinder):
         return contents, classes, functions
 
 
-class ReplayToolTest(unittest.TestCase):
-    """A clean replay proves something only if the tool edits as an editor
-    does and catches wrong finders."""
+def Fields(lst):
+    return [(l.fTokens, l.fLineno, l.fIndent, l.fKind) for l in lst]
 
-    def testLiveListUpdatedAsAnEditorDoes(self):
+
+class EditorProtocolTest(unittest.TestCase):
+    """A clean replay proves something only if the tools and the tests edit as
+    an editor does, and the tool catches wrong finders."""
+
+    def testPrefixAndSuffixStayAndTheMiddleIsReplaced(self):
+        lst = Read('x = (1,\n     2)\ny = 2\nz = 3\n')
+        before = list(lst)
+        # The first logical reads the same but is one line shorter: the line
+        # numbers of a kept prefix never change, so y is replaced too.
+        added, removed = editor.Edit(lst, 'x = (1, 2)\ny = 2\nw = 0\nz = 3\n')
+        self.assertEqual(Fields(lst), Fields(Read('x = (1, 2)\ny = 2\nw = 0\nz = 3\n')))
+        self.assertEqual([any(l is b for b in before) for l in lst], [True, False, False, True])
+        self.assertEqual((removed, added), ([before[1]], lst[1:3]))
+
+    def testBatchReportsEachLogicalOnceWithItsLastLineNumber(self):
         text = 'class A:\n    def f(self):\n        x = 1\n\ny = 2\n'
-        doc, before, outcome = Edit(text, [Splice(1, 0, ['    # c', '']), Splice(4, 1, ['        x = 12'])])
-        tokens = lambda lst: [(l.fTokens, l.fLineno, l.fIndent, l.fKind) for l in lst]  # noqa: E731
-        self.assertEqual(tokens(doc.lst), tokens(replay.Read(doc.text)))
-        kept = [any(l is b for b in before) for l in doc.lst]
-        self.assertEqual(kept, [True, False, False, True, False, True, True])
-        self.assertEqual(outcome.removed, [before[2]])
-        self.assertEqual(outcome.removed[0].fScopeName, 'A#0.f#0')
-        self.assertEqual([l.fTokens for l in outcome.added], [('# c',), (), ('x', '=', '12')])
-        self.assertEqual([l.fLineno for l in doc.lst], range(1, 8))
+        doc, before, outcome = Edit(text, [Splice(1, 0, ['    # c', '']), Splice(4, 1, ['        x = 12']),
+                                           Splice(1, 1, ['    # d'])])
+        self.assertEqual(Fields(doc.lst), Fields(Read(doc.text)))
+        self.assertEqual([any(l is b for b in before) for l in doc.lst], [True, False, False, True, False, True, True])
+        # x = 1 moved two lines down before its own change; `# c` came and went.
+        self.assertEqual([(l.fLineno, l.fTokens) for l in outcome.removed], [(5, ('x', '=', '1'))])
+        self.assertEqual([l.fTokens for l in outcome.added], [(), ('x', '=', '12'), ('# d',)])
+        self.assertEqual(outcome.problems.invariant, None)
 
     def testBrokenFindersAreCaught(self):
         text = 'def f():\n    x = 1\n\ny = 2\n'
@@ -68,23 +81,35 @@ class ReplayToolTest(unittest.TestCase):
         self.assertTrue(any("'A#0.f#0'" in p and 'not in the returned changes' in p
                             for p in outcome.problems.cache), outcome.problems.cache)
 
+    def testReproducerReplaysTheEditThroughTheSameHelpers(self):
+        text = 'class A:\n    def f(self):\n        x = 1\n    y = 2\n'
+        where = tempfile.mkdtemp()
+        path, note = repro.WriteReproducer(where, 'r', text, [Splice(2, 1, [])], 'cache', True, 'here',
+                                           ForgetfulFinder)
+        self.assertIn('shrunk', note)
+        # The real finder agrees, so the reproducer passes.
+        proc = subprocess.Popen([sys.executable, path], stdout=subprocess.PIPE, env=dict(os.environ))
+        self.assertEqual((proc.communicate()[0].splitlines()[-1:], proc.returncode), ([b'no disagreements'], 0))
+        os.remove(path)
+        os.rmdir(where)
+
 
 class StdlibReplayTest(unittest.TestCase):
 
     def testSeededEditsOnAFixedSampleAgree(self):
         files, edits = (8, 80) if SANITIZED else (16, 150)
-        paths = replay.SampleFiles(replay.StdlibFiles(), files, 'test_replay', max_lines=1500)
+        paths = cli.SampleFiles(cli.StdlibFiles(), files, 'test_replay', max_lines=1500)
         self.assertEqual(len(paths), files)
-        log = tempfile.TemporaryFile()
-        summary = replay.run_replay(paths, seed='test_replay', edits_per_file=edits, batch_fraction=0.2,
-                                    cache_check=True, repro_dir=None, quiet=True, out=log)
+        log = tempfile.TemporaryFile('w+')
+        summary = cli.RunReplay(paths, seed='test_replay', edits_per_file=edits, batch_fraction=0.2,
+                                cache_check=True, repro_dir=None, quiet=True, out=log)
         log.seek(0)
         self.assertGreaterEqual(summary['edits'], files * edits * 9 // 10)
         self.assertGreater(summary['batches'], 0)
-        self.assertFalse(replay.Failed(summary), log.read()[:6000])
+        self.assertFalse(cli.Failed(summary), log.read()[:6000])
 
 
-def _Body(name, count):
+def Body(name, count):
     return ''.join('    %s%d = %d\n' % (name, i, i) for i in range(count))
 
 
@@ -101,8 +126,8 @@ kScenarios = [
      'class A:\n    x = 1\n'),
     ('if True:\n\n    y = 2\n',
      'def g():\n\n    y = 2\n'),
-    ('def f():\n' + _Body('a', 40) + 'def f():\n' + _Body('b', 40),
-     'def f():\n    pass\ndef f():\n' + _Body('a', 40) + 'def f():\n' + _Body('b', 40)),
+    ('def f():\n' + Body('a', 40) + 'def f():\n' + Body('b', 40),
+     'def f():\n    pass\ndef f():\n' + Body('a', 40) + 'def f():\n' + Body('b', 40)),
     ('def f():\n    a = 1\ndef f():\n    b = 1\ndef f():\n    c = 1\n',
      'def f():\n    b = 1\ndef f():\n    c = 1\n'),
     ('class A:\n    x = 1\nclass A:\n    y = 1\nclass A:\n    z = 1\n',
@@ -135,11 +160,16 @@ kScenarios = [
     ('class A:\n    x = 1\n', 'class A:\n# note\n    x = 1\n'),
     ('def f():\n    x = 1\n# c\n    y = 2\nz = 3\n', 'def f():\n    x = 1\n# c\nz = 3\n'),
     ('def f():\n    x = 1\n', 'def f():\n    x = 1\n# end\n'),
+    # A forward scan stops at an added logical not visited yet; a rename
+    # reaches past comments that sit in the parent.
+    ('def f():\n    a = 1\n    b = 2\n', 'def g():\n    a = 1\n    c = 9\n    b = 2\n'),
+    ('def f():\n    x = 1\n# c\n        # deep\ny = 2\n',
+     'def f():\n    pass\ndef f():\n    x = 1\n# c\n        # deep\ny = 2\n'),
 ]
 # Several changes in one call.
 kBatchScenarios = [
-    ('import os\n\ndef f():\n' + _Body('a', 30) + 'def f():\n' + _Body('b', 30) + '    return b1\n',
-     'import os\ndef f(): pass\n\ndef f():\n' + _Body('a', 30) + 'def f():\n' + _Body('b', 30) +
+    ('import os\n\ndef f():\n' + Body('a', 30) + 'def f():\n' + Body('b', 30) + '    return b1\n',
+     'import os\ndef f(): pass\n\ndef f():\n' + Body('a', 30) + 'def f():\n' + Body('b', 30) +
      '    return b2\n'),
     ('class A:\n' + ''.join('    def %s(self):\n        pass\n' % n for n in 'fgf'),
      'class A:\n' + ''.join('    def %s(self):\n        pass\n' % n for n in 'ggg')),
@@ -152,8 +182,8 @@ class ScenarioTest(unittest.TestCase):
         failures = []
         for i, (old, new) in enumerate(kScenarios + kBatchScenarios):
             if i >= len(kScenarios):
-                self.assertGreater(len(replay.SplicesBetween(old, new)), 1, i)
-            outcome = replay.CheckPair(old, new, cache_check=True)
+                self.assertGreater(len(checks.SplicesBetween(old, new)), 1, i)
+            outcome = checks.CheckPair(old, new, cache_check=True)
             if outcome.problems.invariant is not None:
                 edit = ', '.join(s.Describe() for s in outcome.splices)
                 failures.append('\n'.join(['scenario %d: %s' % (i, edit)] + outcome.problems.Lines(8)))

@@ -1,6 +1,5 @@
 """How the module calls its overridable steps and the globals it looks up at use."""
 
-import __builtin__
 import re
 import unittest
 
@@ -8,7 +7,7 @@ import pysource.scopebodycache as sbc
 import pysource.symbolinfo as symbolinfo
 from pysource.scopebodycache import CChangeFinder
 
-from support import CapturedStderr, Edit, ModuleGlobal, Names, Read, WholeListNames
+from support import OPTIMIZED, CapturedStderr, Edit, ModuleGlobal, Names, Read, WholeListNames
 
 kSteps = sorted(n for n in vars(CChangeFinder) if re.match('_?[A-Z]', n))
 kSource = '''\
@@ -92,7 +91,7 @@ class OverrideTest(unittest.TestCase):
         added = Edit(lst, kSource.replace('x = 1', 'x = 3'))[0]
         self.assertEqual((finder.FindChanges(added, []), seen), ((set(['A#0.f#1']), set(), set()), []))
         # A long result of an integer step is converted.
-        lst, finder = Prepared(Subclass(_FindScopeIndexForLogical=lambda self, l, i: 7L))
+        lst, finder = Prepared(Subclass(_FindScopeIndexForLogical=lambda self, l, i: 2 ** 64 // 2 ** 61 - 1))
         self.assertIn('f#7', finder.FindChanges(*Edit(lst, kNewDef))[2])
 
 
@@ -102,14 +101,24 @@ class NeverRaisingStepTest(unittest.TestCase):
         with CapturedStderr() as err:
             lst, finder = Prepared(Subclass(_FindScopeIndexForLogical=lambda *args: 'x'))
             finder.FindChanges(*Edit(lst, kNewDef))
+        # Reported, and counted as index 0.
         self.assertIn(kContext + '_FindScopeIndexForLogical', err.getvalue())
+        self.assertEqual(lst[0].fLocalScopeName, 'f#0')
         lst, finder = Prepared()
         with CapturedStderr() as err:
-            self.assertEqual(finder._ProcessDedentedComments(len(lst) + 10), 0)
+            # Optimised, nothing checks the index: the scan past the end finds
+            # no following logical, and the run ends at the end of the list.
+            self.assertEqual(finder._ProcessDedentedComments(len(lst) + 10), len(lst) if OPTIMIZED else 0)
             # Outside a find there is no scopes-seen table to consult.
             self.assertEqual(finder._FindScopeIndexForLogical(lst[0], 0), 0)
-        for step in '_ProcessDedentedComments', '_FindScopeIndexForLogical':
+            # Asked below the end of the table: refused, or, optimised, counted from the whole table.
+            finder._PrepareForFind()
+            finder._FindScopeIndexForLogical(lst[8], 8)
+            self.assertEqual(finder._FindScopeIndexForLogical(lst[0], 0), 1 if OPTIMIZED else 0)
+            finder._Clear()
+        for step in ['_FindScopeIndexForLogical'] + ['_ProcessDedentedComments'] * (not OPTIMIZED):
             self.assertIn(kContext + step, err.getvalue())
+        self.assertEqual(err.getvalue().count(kContext + '_FindScopeIndexForLogical'), 1 + (not OPTIMIZED))
 
 
 class GlobalsLookedUpAtUseTest(unittest.TestCase):
@@ -148,12 +157,13 @@ class GlobalsLookedUpAtUseTest(unittest.TestCase):
             self.assertEqual(Names(lst), WholeListNames(kNewDef), name)
         # The builtins are searched after the module's namespace.
         calls = []
+        builtins = sbc.__builtins__
         with ModuleGlobal(sbc, 'symbolinfo'):
-            __builtin__.symbolinfo = Recording(symbolinfo, calls, 'LeafScopeNameHasIndex')
+            builtins.symbolinfo = Recording(symbolinfo, calls, 'LeafScopeNameHasIndex')
             try:
                 Prepared()
             finally:
-                del __builtin__.symbolinfo
+                del builtins.symbolinfo
         self.assertTrue(calls)
 
     def testGetFullNameForScopeDef(self):

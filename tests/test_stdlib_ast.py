@@ -3,23 +3,13 @@ on small sources that pin down each naming rule."""
 
 import ast
 import os
-import sys
 import unittest
 from textwrap import dedent as D
 
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
-import crosscheck_ast  # noqa: E402
-from pysource._fastaccess import LogicalLineType  # noqa: E402
-from pysource.logicals import ReadLogicals  # noqa: E402
-from pysource.scopebodycache import CChangeFinder  # noqa: E402
+from support import SANITIZED, Named, ReadLogicals, WholePass
+import crosscheck_ast  # tools/ is on the path through support
 
-SANITIZED = bool(os.environ.get('SBC_SANITIZED'))
 kBigFiles = ['decimal.py', 'inspect.py', 'pydoc.py', os.path.join('test', 'test_descr.py')]
-
-
-def Pass(lst):
-    CChangeFinder(lst).FindChanges(lst, [])
-    return lst
 
 
 class StdlibTest(unittest.TestCase):
@@ -33,7 +23,7 @@ class StdlibTest(unittest.TestCase):
         files = logicals = 0
         found = []
         for path in sample:
-            checked, disagreements = crosscheck_ast.check_file(path, whitespace=True)
+            checked, disagreements = crosscheck_ast.CheckFile(path, whitespace=True)
             files += bool(checked)
             logicals += checked
             found.extend(disagreements)
@@ -44,7 +34,7 @@ class StdlibTest(unittest.TestCase):
 
     def testCheckerCatchesAPlantedWrongName(self):
         source = 'class A(object):\n    @staticmethod\n    def f():\n        pass\n'
-        lst = Pass(ReadLogicals(source))
+        lst = Named(source)
         self.assertEqual([], crosscheck_ast.CompareWithAst(lst, ast.parse(source), whitespace=True)[1])
         lst[1].fScopeName = 'A#0.f#0'  # a decorator belongs outside the def
         found = crosscheck_ast.CompareWithAst(lst, ast.parse(source), whitespace=True)[1]
@@ -68,16 +58,6 @@ kSources = [
         '''), {1: ('', None), 2: ('', 'A#0'), 3: ('A#0', None), 4: ('A#0', 'B#0'), 5: ('A#0.B#0', 'm#0'),
                6: ('A#0.B#0.m#0', 'inner#0'), 7: ('A#0.B#0.m#0.inner#0', None), 8: ('A#0.B#0.m#0', None),
                9: ('A#0', None), 10: ('', None)}),
-    (D('''\
-        def f(): return 1
-        def g():
-            if x: return 2
-            for i in y:
-                pass
-            else:
-                pass
-        class C: pass
-        '''), {1: '', 2: '', 3: 'g#0', 4: 'g#0', 5: 'g#0', 6: 'g#0', 7: 'g#0', 8: ''}),
     # Clause headers stay in the statement's scope.
     (D('''\
         def f():
@@ -112,15 +92,6 @@ kSources = [
                7: ('A#0', 'f#2'), 8: ('', 'f#1'), 9: ('', 'f#2')}),
     ('class X: pass\ndef X(): pass\nclass X:\n    def X(self): pass\n    class X: pass\n',
      {1: ('', 'X#0'), 2: ('', 'X#1'), 3: ('', 'X#2'), 4: ('X#2', 'X#0'), 5: ('X#2', 'X#1')}),
-    (D('''\
-        class P(object):
-            @property
-            def v(self):
-                return self._v
-            @v.setter
-            def v(self, value):
-                self._v = value
-        '''), {1: '', 2: 'P#0', 3: ('P#0', 'v#0'), 4: 'P#0.v#0', 5: 'P#0', 6: ('P#0', 'v#1'), 7: 'P#0.v#1'}),
     (D('''\
         class A:
             @one
@@ -177,19 +148,13 @@ class HandWrittenSourcesTest(unittest.TestCase):
 
     def testNames(self):
         for i, (source, expected) in enumerate(kSources):
-            lst = Pass(ReadLogicals(source))
+            lst = ReadLogicals(source)
+            WholePass(lst)
             got = dict((l.fLineno, (l.fScopeName, l.fLocalScopeName)) for l in lst)
             for lineno, want in expected.items():
                 self.assertEqual(got[lineno] if isinstance(want, tuple) else got[lineno][0], want,
                                  'source %d, line %d' % (i, lineno))
-            self.assertEqual([], crosscheck_ast.check_source(source, whitespace=True)[1], i)
-
-    def testNamelessDefOpensNoScope(self):
-        lst = Pass([LogicalLineType(tokens, n, indent, kind) for n, (tokens, indent, kind) in enumerate([
-            (['class', 'A', ':'], 0, 1), (['def'], 4, 2), (['x', '=', '1'], 8, 0),
-            (['def', 'g', '(', ')', ':'], 4, 2), (['y'], 8, 0), (['def'], 0, 2), (['z'], 4, 0)], 1)])
-        self.assertEqual(['', 'A#0', 'A#0', 'A#0', 'A#0.g#0', '', ''], [l.fScopeName for l in lst])
-        self.assertEqual('g#0', lst[3].fLocalScopeName)
+            self.assertEqual([], crosscheck_ast.CheckSource(source, whitespace=True)[1], i)
 
 
 if __name__ == '__main__':

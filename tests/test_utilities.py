@@ -12,7 +12,7 @@ from pysource.scopebodycache import (
     GetNowTime, IsDefKind, IsScopeStartLogical, IsWhitespaceLogical, LogicalCheck, OutOfTime,
     PySet_InplaceOr, RaiseIfNotLogical, SetLogicalLocalScopeDefined, ULongLongValueForDoubleBits)
 
-from support import CapturedStderr, Logical, kBlankKind, kClassKind, kCommentKind, kDefKind
+from support import CapturedStderr, Logical, Outcome, kBlankKind, kClassKind, kCommentKind, kDefKind
 
 
 SubLogical = type('SubLogical', (LogicalLineType,), {})
@@ -21,13 +21,6 @@ MySet = type('MySet', (set,), {})
 
 def Bits(f):
     return struct.unpack('<Q', struct.pack('<d', f))[0]
-
-
-def Outcome(func, *args):
-    try:
-        return func(*args)
-    except Exception as e:
-        return type(e), str(e)
 
 
 class LogicalTest(unittest.TestCase):
@@ -64,72 +57,43 @@ class LogicalTest(unittest.TestCase):
                 (['\\', 'class'], c, None),
                 # Keywords compare up to the first NUL.
                 (['def\0x', 'f'], d, 'f'), (['class\0', 'A'], c, 'A'), (['de\0f', 'f'], d, 'de\0f'),
-                (['def', 'f'], 0, None), (['class', 'A'], kCommentKind, None),
-                (['def', 'f'], kBlankKind, None), (['class', 'A'], 255, None)]:
+                (['def', 'f'], 0, None), (['class', 'A'], kCommentKind, None)]:
             l = Logical(tokens, kind=kind)
             self.assertEqual(GetLocalScopeDefined(l), expected, (tokens, kind))
             if expected is not None:
                 self.assertIs(GetLocalScopeDefined(l), l.fTokens[tokens.index(expected)])
 
     def testStoredNameWins(self):
-        for kind in [kDefKind, kClassKind, 0, kCommentKind]:
+        for kind in [kDefKind, 0]:
             l, name = Logical(['def', 'f'], kind=kind), 'g#3'
             self.assertIsNone(SetLogicalLocalScopeDefined(l, name))
-            self.assertIs(l.fLocalScopeName, name)
             self.assertIs(GetLocalScopeDefined(l), name)
-        # None clears it; the tokens count again.
-        l = Logical(['def', 'f'], kind=kDefKind)
-        SetLogicalLocalScopeDefined(l, 'g#3')
+        # None clears it; the tokens count again. A name of another type is refused when read.
         SetLogicalLocalScopeDefined(l, None)
-        self.assertIsNone(l.fLocalScopeName)
-        self.assertEqual(GetLocalScopeDefined(l), 'f')
-        for value, type_name in [(5, 'int'), (u'f', 'unicode'), (bytearray('f'), 'bytearray')]:
-            l = Logical(['def', 'f'], kind=kDefKind)
+        self.assertEqual((l.fLocalScopeName, GetLocalScopeDefined(Logical(['def', 'f'], kind=kDefKind))), (None, 'f'))
+        for value, type_name in [(5, 'int'), (u'f', 'unicode')]:
             SetLogicalLocalScopeDefined(l, value)
-            self.assertIs(l.fLocalScopeName, value)
-            self.assertEqual(Outcome(GetLocalScopeDefined, l),
-                             (TypeError, 'Expected bytes, got %s' % type_name))
+            self.assertEqual(Outcome(GetLocalScopeDefined, l), (TypeError, 'Expected bytes, got %s' % type_name))
 
 
 class SmallFunctionsTest(unittest.TestCase):
 
-    def testSetInplaceOrReportsWhetherAnythingWasAdded(self):
+    def testSetInplaceOr(self):
         s = set([1, 2])
-        for to_add, added, size in [(set([2, 3]), True, 3), (frozenset([1, 3]), False, 3),
-                                    (set(), False, 3), (MySet([4]), True, 4), (s, False, 4)]:
+        for to_add, added in [(set([2, 3]), True), (frozenset([1, 3]), False), (MySet([4]), True), (s, False)]:
             self.assertIs(PySet_InplaceOr(s, to_add), added, to_add)
-            self.assertEqual(len(s), size)
         self.assertEqual(s, set([1, 2, 3, 4]))
-
-    def testSetInplaceOrErrors(self):
-        def Other(result):  # set |= x falls back to x.__ror__, whose result is checked
-            return type('Other', (object,), {'__ror__': lambda self, other: result})()
-
-        def OperatorError(to_add):
-            try:
-                probe = set()
-                probe |= to_add
-            except TypeError as e:
-                return TypeError, str(e)
-
-        def Wrong(name):
-            return TypeError, "Argument 'set_obj' has incorrect type (expected set, got %s)" % name
-
+        # set |= x falls back to x.__ror__, whose result must be a set; it is measured, not stored.
+        other = lambda result: type('Other', (object,), {'__ror__': lambda self, o: result})()  # noqa: E731
+        self.assertEqual([PySet_InplaceOr(s, other(set([5]))), PySet_InplaceOr(s, other(set('abcd')))], [True, False])
+        self.assertEqual(s, set([1, 2, 3, 4]))
+        wrong = "Argument 'set_obj' has incorrect type (expected set, got %s)"
         for set_obj, to_add, expected in [
                 (None, set([1]), (TypeError, "object of type 'NoneType' has no len()")),
-                (frozenset(), set([1]), Wrong('frozenset')), (MySet(), set([1]), Wrong('MySet')),
-                ([], set([1]), Wrong('list'))] + [
-                (set([9]), x, OperatorError(x)) for x in [[1], None, (1,), 'ab']] + [
-                (set([9]), Other(r), (TypeError, 'Expected set, got ' + type(r).__name__))
-                for r in [[1], frozenset([1, 2]), MySet([1, 2])]]:
-            self.assertEqual(Outcome(PySet_InplaceOr, set_obj, to_add), expected, (set_obj, to_add))
-            if type(set_obj) is set:
-                self.assertEqual(set_obj, set([9]))
-        # A set result is measured against the original length, and not stored.
-        s = set([1])
-        self.assertIs(PySet_InplaceOr(s, Other(set([5, 6]))), True)
-        self.assertIs(PySet_InplaceOr(s, Other(set([5]))), False)
-        self.assertEqual(s, set([1]))
+                (frozenset(), set([1]), (TypeError, wrong % 'frozenset')), (MySet(), s, (TypeError, wrong % 'MySet')),
+                (s, other(MySet([1])), (TypeError, 'Expected set, got MySet'))]:
+            self.assertEqual(Outcome(PySet_InplaceOr, set_obj, to_add), expected)
+        self.assertRaises(TypeError, PySet_InplaceOr, s, [1])  # the operator's own error
 
     def testNowAndOutOfTime(self):
         before, now, after = time.time(), GetNowTime(), time.time()
@@ -137,40 +101,27 @@ class SmallFunctionsTest(unittest.TestCase):
         self.assertTrue(before - 0.01 <= now <= after + 0.01, (before, now, after))
         self.assertLessEqual(now, GetNowTime())
         self.assertIs(OutOfTime(GetNowTime()), True)  # a time already reached counts
-        for end, out in [(0.0, True), (1e18, False), (time.time() - 1.0, True),
-                         (time.time() + 60.0, False), (0, True),
-                         (float('-inf'), True), (float('inf'), False)]:
+        for end, out in [(0, True), (time.time() - 1.0, True), (time.time() + 60.0, False)]:
             self.assertIs(OutOfTime(end), out, end)
-        self.assertRaises(TypeError, OutOfTime, 'soon')
         self.assertRaises(TypeError, OutOfTime, None)
 
     def testBits(self):
-        for f in [0.0, -0.0, 1.0, -2.5, 1e308, 5e-324, 2.2250738585072014e-308,
-                  float('inf'), float('-inf'), math.pi, 1]:
+        for f in [0.0, -0.0, -2.5, 5e-324, float('-inf'), math.pi, 1]:
             bits = ULongLongValueForDoubleBits(f)
-            self.assertIsInstance(bits, (int, long))
             self.assertEqual(bits, Bits(f), f)
             self.assertEqual(Bits(DoubleValueForULongLongBits(bits)), Bits(f), f)
             signed = struct.unpack('<q', struct.pack('<d', f))[0]
             self.assertEqual(Bits(DoubleValueForPyIntBits(signed)), Bits(f), f)
-        for n in [0, 1, 1 << 63, 0x7ff0000000000000, 2 ** 64 - 1, 0x7ff8000000000001]:
-            f = DoubleValueForULongLongBits(n)
-            self.assertIsInstance(f, float)
-            self.assertEqual(ULongLongValueForDoubleBits(f), n, hex(n))
-        self.assertEqual(DoubleValueForULongLongBits(0x3ff0000000000000), 1.0)
+        for n in [1 << 63, 2 ** 64 - 1, 0x7ff8000000000001]:
+            self.assertEqual(ULongLongValueForDoubleBits(DoubleValueForULongLongBits(n)), n, hex(n))
         self.assertEqual(DoubleValueForPyIntBits(0x3ff0000000000000), 1.0)
         # Signed bits are sign-extended.
         self.assertTrue(math.isnan(DoubleValueForPyIntBits(-1)))
         self.assertEqual(ULongLongValueForDoubleBits(DoubleValueForPyIntBits(-1)), 2 ** 64 - 1)
-        self.assertEqual(Bits(DoubleValueForPyIntBits(-2 ** 63)), 1 << 63)
         self.assertEqual(Bits(DoubleValueForPyIntBits(-2)), 2 ** 64 - 2)
         for func, arg, exc in [
-                (ULongLongValueForDoubleBits, '1.0', TypeError),
-                (DoubleValueForULongLongBits, 1.0, TypeError),
-                (DoubleValueForULongLongBits, -1, OverflowError),
-                (DoubleValueForULongLongBits, 2 ** 64, OverflowError),
-                (DoubleValueForPyIntBits, 2 ** 63, OverflowError),
-                (DoubleValueForPyIntBits, -2 ** 63 - 1, OverflowError)]:
+                (ULongLongValueForDoubleBits, '1.0', TypeError), (DoubleValueForULongLongBits, -1, OverflowError),
+                (DoubleValueForULongLongBits, 2 ** 64, OverflowError), (DoubleValueForPyIntBits, 2 ** 63, OverflowError)]:
             self.assertRaises(exc, func, arg)
 
     def testDefKinds(self):
@@ -178,21 +129,16 @@ class SmallFunctionsTest(unittest.TestCase):
         self.assertNotIn(symbolinfo.kClassKind, kinds)
         for kind in range(-128, 128):
             self.assertIs(IsDefKind(kind), kind in kinds, kind)
-        for kind in [128, -129, 2 ** 40]:
-            self.assertEqual(Outcome(IsDefKind, kind),
-                             (OverflowError, 'value too large to convert to char'))
+        for kind in [128, -129]:
+            self.assertEqual(Outcome(IsDefKind, kind), (OverflowError, 'value too large to convert to char'))
         self.assertRaises(TypeError, IsDefKind, 'F')
-        self.assertRaises(TypeError, IsDefKind, None)
 
     def testInfoBytesKind(self):
         plain = symbolinfo.kPlainEquivKind
         wrong = "Argument 'ibytes' has incorrect type (expected str, got %s)"
         for ibytes, expected in [
-                ('', plain), ('x', plain), (':', plain), ('ab', plain), ('x:y', plain),
-                (':x', ord('x')), (':Fname', ord('F')), ('::', ord(':')), (':\xff', -1),
-                (':\x80rest', -128), (':\0', 0), (5, (TypeError, wrong % 'int')),
-                (u':x', (TypeError, wrong % 'unicode')),
-                (bytearray(':x'), (TypeError, wrong % 'bytearray'))]:
+                ('x', plain), (':', plain), ('x:y', plain), (':Fname', ord('F')), (':\xff', -1),
+                (':\0', 0), (u':x', (TypeError, wrong % 'unicode'))]:
             self.assertEqual(Outcome(GetInfoBytesKind, ibytes), expected, repr(ibytes))
         with CapturedStderr() as err:
             self.assertEqual(GetInfoBytesKind(None), 0)

@@ -1,104 +1,86 @@
 """The whole-list pass: names of a freshly read file, and the change sets."""
+
 import unittest
 
-from finder_support import (CChangeFinder, blank, code, comment, deff, finder_fields, logical,
-                            names, read_named, run_python, scope_names, whole_pass)
-from pysource.logicals import ReadLogicals
+from support import (OPTIMIZED, CapturedStderr, CChangeFinder, Code, Def, FinderFields,
+                     Logical, Named, Names, Outcome, Read, ScopeNames, WholePass, kBlankKind,
+                     kCommentKind)
 
 
-class HandBuiltLists(unittest.TestCase):
+class HandBuiltListTest(unittest.TestCase):
 
-    def test_def_at_same_indent_closes_the_previous_one(self):
-        lst = [deff(1, 0, 'f'), deff(2, 0, 'g'), code(3, 4)]
-        whole_pass(lst)
-        self.assertEqual(scope_names(lst), ['', '', 'g#0'])
+    def testScopesCloseAtTheirOwnIndentNotAtDedentedComments(self):
+        lst = [Def(1, 0, 'f'), Def(2, 0, 'g'), Code(3, 4)]
+        WholePass(lst)
+        self.assertEqual(ScopeNames(lst), ['', '', 'g#0'])
+        comment = lambda lineno: Logical(['# c'], lineno, 0, kCommentKind)  # noqa: E731
+        lst = [Def(1, 0, 'f'), Code(2, 4), comment(3), Logical([], 4, 0, kBlankKind), Code(5, 4), comment(6)]
+        WholePass(lst)
+        self.assertEqual(ScopeNames(lst), ['', 'f#0', 'f#0', 'f#0', 'f#0', ''])
+        self.assertEqual(Names(Named('async def f():\n    pass\n')), [('', 'f#0'), ('f#0', None)])
 
-    def test_comment_at_left_margin_does_not_close_the_function(self):
-        lst = [deff(1, 0, 'f'), code(2, 4), comment(3, 0), blank(4), code(5, 4), comment(6, 0)]
-        whole_pass(lst)
-        self.assertEqual(scope_names(lst), ['', 'f#0', 'f#0', 'f#0', 'f#0', ''])
+    def testNegativeIndentWouldCloseTheModuleScope(self):
+        # Optimised, the assert before closing is skipped and the empty stack has no top.
+        self.assertEqual(Outcome(WholePass, [Code(1, -1)]),
+                         (IndexError, 'list index out of range') if OPTIMIZED else (AssertionError, ''))
 
-    def test_async_def(self):
-        lst = read_named("async def f():\n    pass\n")
-        self.assertEqual(names(lst), [('', 'f#0'), ('f#0', None)])
+    def testStaleIndicesAreCountedAfresh(self):
+        lst = [Def(1, 0, 'f'), Def(2, 0, 'f')]
+        lst[0].fLocalScopeName = lst[1].fLocalScopeName = 'f#5'
+        WholePass(lst)
+        self.assertEqual([l.fLocalScopeName for l in lst], ['f#0', 'f#1'])
+
+    def testNamelessDefinitionOpensNoScopeAndReportsNothing(self):
+        lst = [Logical(tokens, n, indent, kind) for n, (tokens, indent, kind) in enumerate([
+            (['class', 'A', ':'], 0, 1), (['def'], 4, 2), (['x', '=', '1'], 8, 0),
+            (['def', 'g', '(', ')', ':'], 4, 2), (['y'], 8, 0), (['def'], 0, 2), (['z'], 4, 0)], 1)]
+        with CapturedStderr() as err:
+            WholePass(lst)
+        self.assertEqual((ScopeNames(lst), err.getvalue()), (['', 'A#0', 'A#0', 'A#0', 'A#0.g#0', '', ''], ''))
+        self.assertEqual(lst[3].fLocalScopeName, 'g#0')
 
 
-class RepeatedDefinitions(unittest.TestCase):
+class ChangeSetTest(unittest.TestCase):
 
-    def test_change_sets(self):
-        lst = ReadLogicals("class A:\n    def f(self): pass\ndef g(): pass\ndef g(): pass\n")
-        finder, (contents, classes, functions) = whole_pass(lst)
-        self.assertEqual(contents, set(['', 'A#0', 'A#0.f#0', 'g#0', 'g#1']))
-        self.assertEqual(classes, set(['A#0']))
-        self.assertEqual(functions, set(['A#0.f#0', 'g#0', 'g#1']))
+    def testEveryScopeMetIsAChange(self):
+        lst = Read("class A:\n    def f(self): pass\ndef g(): pass\ndef g(): pass\n")
+        self.assertEqual(WholePass(lst)[1], (set(['', 'A#0', 'A#0.f#0', 'g#0', 'g#1']), set(['A#0']),
+                                             set(['A#0.f#0', 'g#0', 'g#1'])))
+        self.assertEqual(WholePass([])[1], (set(['']), set(), set()))
+        # A second pass over named logicals keeps the names and reports them again.
+        first = Names(lst)
+        self.assertEqual(WholePass(lst)[1][2], set(['A#0.f#0', 'g#0', 'g#1']))
+        self.assertEqual(Names(lst), first)
 
-    def test_empty_list(self):
-        self.assertEqual(whole_pass([])[1], (set(['']), set(), set()))
-
-    def test_scopes_seen_table_after_the_pass(self):
+    def testScopesSeenTableAfterThePass(self):
         tables = []
 
         class Watch(CChangeFinder):
             def _FindChangesEntireListAdded(self):
                 CChangeFinder._FindChangesEntireListAdded(self)
-                tables.append(finder_fields(self))
+                tables.append(FinderFields(self))
 
-        lst = ReadLogicals("def f(): pass\ndef f(): pass\nclass C:\n    def f(self): pass\n")
-        finder, result = whole_pass(lst, Watch)
-        fields = tables[0]
-        self.assertEqual(fields['scopes_seen'], {'f': 1, 'C': 0, 'C#0.f': 0})
+        finder = WholePass(Read("def f(): pass\ndef f(): pass\nclass C:\n    def f(self): pass\n"), Watch)[0]
+        self.assertEqual(tables[0]['scopes_seen'], {'f': 1, 'C': 0, 'C#0.f': 0})
         # The pass counts without moving the indices.
-        self.assertEqual((fields['end_index_for_scopes_seen'], fields['next_change_index'],
-                          fields['last_processed_index']), (0, -1, -1))
-        self.assertEqual(finder_fields(finder)['scopes_seen'], None)
-
-    def test_second_whole_pass_gives_the_same_names(self):
-        source = ("def f():\n    pass\ndef f():\n    x = 1\n"
-                  "class C:\n    def m(self): pass\n    def m(self): pass\n")
-        lst = read_named(source)
-        first = names(lst)
-        finder, result = whole_pass(lst)
-        self.assertEqual(names(lst), first)
-        self.assertEqual(result[2], set(['f#0', 'f#1', 'C#0.m#0', 'C#0.m#1']))
-
-    def test_stale_index_on_a_fresh_pass_is_renumbered(self):
-        lst = [deff(1, 0, 'f'), deff(2, 0, 'f')]
-        lst[0].fLocalScopeName = 'f#5'
-        lst[1].fLocalScopeName = 'f#5'
-        whole_pass(lst)
-        self.assertEqual([l.fLocalScopeName for l in lst], ['f#0', 'f#1'])
+        self.assertEqual([tables[0][k] for k in ('end_index_for_scopes_seen', 'next_change_index',
+                                                 'last_processed_index')], [0, -1, -1])
+        self.assertIsNone(FinderFields(finder)['scopes_seen'])
 
 
-class ScopeStartWithoutName(unittest.TestCase):
+class FailureAndOverrideTest(unittest.TestCase):
 
-    def test_no_unraisable_noise(self):
-        status, out, err = run_python(
-            "from pysource._fastaccess import LogicalLineType as L\n"
-            "from pysource.scopebodycache import CChangeFinder\n"
-            "lst = [L(['def'], 1, 0, 2), L(['x'], 2, 4, 0)]\n"
-            "CChangeFinder(lst).FindChanges(lst, [])\n"
-            "print [l.fScopeName for l in lst]\n")
-        self.assertEqual((status, out.strip(), err), (0, "['', '']", ''))
-
-
-class FailuresAndOverrides(unittest.TestCase):
-
-    def test_non_logical_stops_the_pass_and_leaves_the_finder_idle(self):
-        lst = [code(1, 0), 'not a logical']
+    def testNonLogicalStopsThePassAndLeavesTheFinderIdle(self):
+        lst = [Code(1, 0), 'not a logical']
         finder = CChangeFinder(lst)
-        with self.assertRaisesRegexp(TypeError, '^Argument must be a logical$'):
-            finder.FindChanges(lst, [])
+        # Idle again: the second call is not refused as recursive.
+        self.assertEqual([Outcome(finder.FindChanges, lst, []) for _ in range(2)],
+                         [(TypeError, 'Argument must be a logical')] * 2)
         self.assertEqual(lst[0].fScopeName, '')
-        # Idle again: the next call is not refused as recursive.
-        with self.assertRaisesRegexp(TypeError, '^Argument must be a logical$'):
-            finder.FindChanges(lst, [])
+        self.assertEqual(Outcome(finder._FindChangesEntireListAdded),
+                         (AttributeError, "'NoneType' object has no attribute 'add'"))
 
-    def test_called_outside_find_changes(self):
-        finder = CChangeFinder([code(1, 0)])
-        with self.assertRaisesRegexp(AttributeError, "^'NoneType' object has no attribute 'add'$"):
-            finder._FindChangesEntireListAdded()
-
-    def test_overrides_see_every_logical(self):
+    def testOverridesSeeEveryLogicalAndNameTheScopes(self):
         seen = []
 
         class Spy(CChangeFinder):
@@ -106,75 +88,29 @@ class FailuresAndOverrides(unittest.TestCase):
                 seen.append((i, pair))
                 return CChangeFinder._SetLogicalScopeNames(self, logical, i, pair)
 
-        lst = read_named("class A:\n    x = 1\n")
-        whole_pass(lst, Spy)
-        self.assertEqual(seen, [(0, ('', 'A#0')), (1, ('A#0', None))])
-
-    def test_leaf_override_names_the_scopes(self):
-        class Upper(CChangeFinder):
             def _GetLeafScopeWithIndex(self, logical, scope_index):
                 return 'F%d' % scope_index
 
-        lst = ReadLogicals("def f():\n    x = 1\n")
-        finder, result = whole_pass(lst, Upper)
-        self.assertEqual(names(lst), [('', 'F0'), ('F0', None)])
-        self.assertEqual(result, (set(['', 'F0']), set(), set(['F0'])))
+        lst = Read("def f():\n    x = 1\n")
+        self.assertEqual(WholePass(lst, Spy)[1], (set(['', 'F0']), set(), set(['F0'])))
+        self.assertEqual(seen, [(0, ('', 'F0')), (1, ('F0', None))])
+        self.assertEqual(Names(lst), [('', 'F0'), ('F0', None)])
 
-    def test_reentry_from_an_override_is_refused(self):
-        class Reenter(CChangeFinder):
-            def _SetLogicalScopeNames(self, logical, i, pair):
-                self.FindChanges([], [])
+    def testDedentedCommentStepThatDoesNotAdvance(self):
+        def Raise(self, i):
+            raise KeyError('boom')
 
-        lst = ReadLogicals("x = 1\n")
-        finder = Reenter(lst)
-        with self.assertRaisesRegexp(ValueError, 'FindChanges cannot be called recursively'):
-            finder.FindChanges(lst, [])
-        finder._SetLogicalScopeNames = lambda *a: None
-        self.assertEqual(finder.FindChanges(lst, [])[0], set(['']))
-
-    def test_override_emptying_the_list_mid_pass(self):
-        class Shrink(CChangeFinder):
-            def _SetLogicalScopeNames(self, logical, i, pair):
-                del self._fLogicalList[:]
-                return CChangeFinder._SetLogicalScopeNames(self, logical, i, pair)
-
-        lst = ReadLogicals("class A:\n    x = 1\n    y = 2\n")
-        finder = Shrink(lst)
-        with self.assertRaisesRegexp(IndexError, 'list index out of range'):
-            finder.FindChanges(lst, [])
-        self.assertEqual(lst, [])
-
-    def test_dedented_comment_step_failure_is_reported(self):
-        status, out, err = run_python(
-            "from pysource.logicals import ReadLogicals\n"
-            "from pysource.scopebodycache import CChangeFinder\n"
-            "class Bad(CChangeFinder):\n"
-            "    def _ProcessDedentedComments(self, i):\n"
-            "        raise KeyError('boom')\n"
-            "lst = ReadLogicals('def f():\\n    x = 1\\n# c\\ny = 2\\n')\n"
-            "try:\n"
-            "    Bad(lst).FindChanges(lst, [])\n"
-            "except AssertionError:\n"
-            "    print 'assertion'\n")
-        self.assertEqual((status, out.strip()), (0, 'assertion'))
-        self.assertIn("KeyError: 'boom'", err)
-        self.assertIn('pysource.scopebodycache.CChangeFinder._ProcessDedentedComments', err)
-
-    def test_optimised_run_refuses_a_step_that_does_not_advance(self):
-        status, out, err = run_python(
-            "from pysource.logicals import ReadLogicals\n"
-            "from pysource.scopebodycache import CChangeFinder\n"
-            "class Stuck(CChangeFinder):\n"
-            "    def _ProcessDedentedComments(self, i):\n"
-            "        return 0\n"
-            "lst = ReadLogicals('def f():\\n    x = 1\\n# c\\ny = 2\\n')\n"
-            "try:\n"
-            "    Stuck(lst).FindChanges(lst, [])\n"
-            "except RuntimeError as e:\n"
-            "    print str(e).split(',')[0]\n", optimize=True)
-        self.assertEqual((status, out.strip()),
-                         (0, "_ProcessDedentedComments answered 0 for the comment or blank line at index 2"),
-                         err)
+        for step in Raise, lambda self, i: 0:
+            lst = Read('def f():\n    x = 1\n# c\ny = 2\n')
+            finder = type('Stuck', (CChangeFinder,), {'_ProcessDedentedComments': step})(lst)
+            with CapturedStderr() as err:
+                # Optimised, going on would leave the run unnamed.
+                self.assertRaises(RuntimeError if OPTIMIZED else AssertionError,
+                                  finder.FindChanges, lst, [])
+            if step is Raise:
+                self.assertIn("KeyError: 'boom'", err.getvalue())
+                self.assertIn('pysource.scopebodycache.CChangeFinder._ProcessDedentedComments',
+                              err.getvalue())
 
 
 if __name__ == '__main__':

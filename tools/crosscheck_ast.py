@@ -22,11 +22,11 @@ Exits 1 when any logical disagrees.
 import argparse
 import ast
 import bisect
-import os
 import random
 import sys
 
 import toolpath
+from progress import Progress
 
 toolpath.setup()
 
@@ -236,7 +236,7 @@ def CompareWithAst(lst, tree, path='<string>', whitespace=False):
     return checked, found
 
 
-def check_file(path, whitespace=False):
+def CheckFile(path, whitespace=False):
     """(logicals checked, disagreements) for the file at `path`.
 
     A file that ReadLogicals or ast.parse refuses gives (0, []).
@@ -247,8 +247,8 @@ def check_file(path, whitespace=False):
     return CheckLogicals(parsed[0], parsed[1], path, whitespace)
 
 
-def check_source(source, path='<string>', whitespace=False):
-    """check_file for a source string; it must be accepted by both readers."""
+def CheckSource(source, path='<string>', whitespace=False):
+    """CheckFile for a source string; it must be accepted by both readers."""
     lst, tree = ReadLogicals(source, path), ast.parse(source, path)
     return CheckLogicals(lst, tree, path, whitespace)
 
@@ -274,15 +274,17 @@ def main(argv=None):
         paths = sorted(random.Random(args.seed).sample(paths, args.sample))
     files = skipped = logicals = 0
     found = []
-    for path in paths:
-        parsed = ParseBoth(path)
-        if parsed is None:
-            skipped += 1
-            continue
-        checked, disagreements = CheckLogicals(parsed[0], parsed[1], path, args.whitespace)
-        files += 1
-        logicals += checked
-        found.extend(disagreements)
+    with Progress(len(paths)) as progress:
+        for done, path in enumerate(paths):
+            progress.Show(done, note='%d disagreements' % len(found))
+            parsed = ParseBoth(path)
+            if parsed is None:
+                skipped += 1
+                continue
+            checked, disagreements = CheckLogicals(parsed[0], parsed[1], path, args.whitespace)
+            files += 1
+            logicals += checked
+            found.extend(disagreements)
     print('files checked: %d (skipped, not accepted by both readers: %d)' % (files, skipped))
     print('logicals checked: %d' % logicals)
     print('disagreements: %d in %d files' % (len(found), len(set(d.path for d in found))))
@@ -292,4 +294,4 @@ def main(argv=None):
 
 
 if __name__ == '__main__':
-    sys.exit(main())
+    toolpath.RunMain(main)

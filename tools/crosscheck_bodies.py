@@ -24,6 +24,7 @@ import os
 import sys
 
 import toolpath
+from progress import Progress
 
 toolpath.setup()
 
@@ -140,7 +141,9 @@ def CheckSource(source, tree=None):
 def CheckFiles(paths):
     """Totals over `paths`: dict of files, skipped, scopes, disagreements, details."""
     totals = {'files': 0, 'skipped': 0, 'scopes': 0, 'disagreements': 0, 'details': []}
-    for path in paths:
+    progress = Progress(len(paths))
+    for done, path in enumerate(paths):
+        progress.Show(done, note='%d disagreements' % totals['disagreements'])
         with open(path, 'rb') as fp:
             source = fp.read()
         tree = Parse(source)
@@ -153,6 +156,7 @@ def CheckFiles(paths):
         totals['scopes'] += scopes
         totals['disagreements'] += len(disagreements)
         totals['details'].extend('%s: %s' % (path, d) for d in disagreements)
+    progress.Close()
     return totals
 
 
@@ -176,4 +180,4 @@ def main(argv=None):
 
 
 if __name__ == '__main__':
-    sys.exit(main())
+    toolpath.RunMain(main)

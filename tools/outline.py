@@ -204,4 +204,4 @@ def main(argv=None):
     return 0
 
 if __name__ == '__main__':
-    sys.exit(main())
+    toolpath.RunMain(main)

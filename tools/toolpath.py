@@ -1,5 +1,6 @@
 """Makes the built packages importable for the scripts in tools/."""
 
+import errno
 import os
 import sys
 
@@ -38,3 +39,18 @@ def StdlibFiles(root=None):
         dirnames[:] = sorted(d for d in dirnames if d != 'site-packages')
         paths.extend(os.path.join(dirpath, f) for f in filenames if f.endswith('.py'))
     return sorted(paths)
+
+
+def RunMain(main):
+    """Runs a tool's main() and exits with its status; a reader that stops
+    early (`tool | head`) ends the tool quietly."""
+    try:
+        status = main()
+        sys.stdout.flush()
+    except IOError as exc:  # BrokenPipeError on 3.x is one too
+        if exc.errno != errno.EPIPE:
+            raise
+        # Whatever is still buffered would fail again at exit: point stdout at nothing.
+        os.dup2(os.open(os.devnull, os.O_WRONLY), sys.stdout.fileno())
+        status = 1
+    sys.exit(status)
