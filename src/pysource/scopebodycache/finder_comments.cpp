@@ -91,6 +91,8 @@ Py_ssize_t ProcessDedentedComments(PyObject* self, Py_ssize_t first) {
 
 Py_ssize_t CommentRunEnd(PyObject* self, Py_ssize_t first) {
     const Py_ssize_t n = logicalListLength(self);
+    // Optimised, a first index past the end is not refused by an assert.
+    if (first >= n) return n;
     for (Py_ssize_t k = first + 1; k < n; ++k) {
         if (!isWhitespace(logicalAt(self, k).record())) return k;
     }

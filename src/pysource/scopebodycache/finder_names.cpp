@@ -89,7 +89,8 @@ py::Ref UpdateLogicalScopeName(PyObject* self, PyObject* logicalObj, Py_ssize_t 
         // Filed before the nested scan, which counts the definitions of
         // this key after it.
         fileDefinition(self, logicalObj, i);
-        if (differs) ScanForwardForChangedScopes(self, i + 1, logical->fIndent);
+        // i comes from the caller (from Python, optimised, it is not checked).
+        if (differs && i < PY_SSIZE_T_MAX) ScanForwardForChangedScopes(self, i + 1, logical->fIndent);
     }
     return py::Ref::own(scopeName);
 }
