@@ -1,114 +1,51 @@
 #!/usr/bin/env python2.7
 """Cost of one FindChanges call for common edits, by file size and place.
 
-    bench_edits.py [--sizes 1000,10000,100000] [--reps N]
+    bench_edits.py [--sizes 1000,10000,100000] [--batches N] [--calls N]
 
 Files of about 1k, 10k and 100k logicals are synthesised (classes with
 methods, module functions, comments, blank lines; names unique per scope,
-as in real code). At the start, middle and end of each file the bench
-times: typing a character into a statement (and deleting it), inserting a
-method header and removing it again, a comment line typed above a method
-header (and deleted), and a batch of three typed lines and such a comment
-(and its undo). Each edit is undone after it is timed, so the list keeps
-its size. The medians are printed, with the 100k/1k ratio for typing and
-the peak memory.
+as in real code) and named once. At the start, middle and end of each file
+these edits are made and undone, many times in a batch, and the batch's
+process CPU time divided by its FindChanges calls:
+
+  typing       a statement replaced by a typed variant, and back;
+  def          a method header with a name new to its class, inserted and
+               removed again (the list keeps its size);
+  repeated def a header named like a later method of its class, which
+               renumbers that method and renames its body, in and out;
+  comment      a comment line above a method header, in and out;
+  batch        three typed statements and such a comment in one call, and
+               the undo in one call.
+
+The caller's own work in each batch (the list assignments, inserts and
+deletes) is timed alone and taken off, so the figures are the calls,
+including the Python call itself. Each cell is the median over batches with
+the 10th-90th percentile spread; the 100k/1k ratio of each edit follows.
 """
 
+from __future__ import print_function
+
 import argparse
-import os
-import resource
 import sys
-import time
 
-_kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
-sys.path.insert(0, os.path.join(_kRepoDir, 'tools'))
+import benchkit
+from benchkit import CChangeFinder, FormatSpread, LogicalLineType, Spread, TimeBatches
 
-import toolpath  # noqa: E402
-from progress import Progress  # noqa: E402
-from replaykit.checks import Names, WholePass  # noqa: E402  (imports the built packages)
-from replaykit.editor import Clone  # noqa: E402
-from pysource._fastaccess import LogicalLineType  # noqa: E402
-from pysource.logicals import ReadLogicals, kDefKind  # noqa: E402
-from pysource.scopebodycache import CChangeFinder  # noqa: E402
+from pysource.logicals import kCommentKind, kDefKind
+
+try:
+    xrange
+except NameError:
+    xrange = range
 
 kPlaces = (('start', 0.02), ('middle', 0.5), ('end', 0.98))
-kEdits = ('typing', 'insert def', 'remove def', 'comment', 'batch')
-
-_kUnit = '''\
-# Part %(k)d: a small widget and its helpers.
-
-
-class Widget%(k)d(object):
-    """Collects numbers and reports on them."""
-
-    kLimit = %(k)d
-
-    def __init__(self, name, items=None):
-        self.name = name
-        self.items = list(items or [])
-        self._cache = None
-
-    def add(self, item):
-        # Keep the cache honest.
-        self._cache = None
-        if item not in self.items:
-            self.items.append(item)
-        return self
-
-    def total(self):
-        if self._cache is None:
-            result = 0
-            for item in self.items:
-                if item > self.kLimit:
-                    continue
-                result += item
-            self._cache = result
-        return self._cache
-
-    @property
-    def size(self):
-        return len(self.items)
-
-    def __repr__(self):
-        return 'Widget%(k)d(%%r, %%r)' %% (self.name, self.items)
-
-
-def make_widget%(k)d(name, *items):
-    widget = Widget%(k)d(name)
-    for item in items:
-        widget.add(item)
-# Dedented note inside the function body.
-    return widget
-
-
-def report%(k)d(widgets):
-    lines = []
-    for w in widgets:
-        lines.append('%%s: %%d' %% (w.name, w.total()))
-
-    return '\\n'.join(lines)
-'''
-
-
-def Synthesise(logicals):
-    """Source text of about `logicals` logicals."""
-    per_unit = len(ReadLogicals(_kUnit % {'k': 0}))
-    units = max(1, int(round(float(logicals) / per_unit)))
-    return ''.join(_kUnit % {'k': k} for k in range(units))
-
-
-def Shift(lst, start, delta):
-    for l in lst[start:]:
-        l.fLineno += delta
+kEdits = ('typing', 'def', 'repeated def', 'comment', 'batch')
 
 
 def Find(lst, start, want):
     """Index of the first logical at or after `start` that satisfies `want`."""
-    start = min(start, len(lst))
-    for i in range(start, len(lst)):
-        if want(lst[i]):
-            return i
-    for i in range(start - 1, -1, -1):
+    for i in list(range(min(start, len(lst)), len(lst))) + list(range(min(start, len(lst)) - 1, -1, -1)):
         if want(lst[i]):
             return i
     raise ValueError('no logical to edit')
@@ -118,177 +55,157 @@ def IsBodyStatement(l):
     return l.fKind == 0 and l.fIndent >= 8 and l.fTokens[0] not in ('return', 'for', 'if')
 
 
-def IsMethodHeader(l):
-    return l.fKind == kDefKind and l.fIndent == 4
+def IsHeader(name):
+    return lambda l: l.fKind == kDefKind and l.fIndent == 4 and l.fTokens[1] == name
 
 
 def Typed(l):
-    tokens = (l.fTokens[0] + 'x',) + l.fTokens[1:]
-    return LogicalLineType(tokens, l.fLineno, l.fIndent, l.fKind)
+    return LogicalLineType((l.fTokens[0] + 'x',) + tuple(l.fTokens[1:]), l.fLineno, l.fIndent, l.fKind)
 
 
-def Untyped(l):
-    tokens = (l.fTokens[0][:-1],) + l.fTokens[1:]
-    return LogicalLineType(tokens, l.fLineno, l.fIndent, l.fKind)
+def Pair(finder, first, second):
+    """A batch runner alternating two edits, each followed by its call
+    FindChanges(added, removed), and the same edits without the calls.
+    first, second: (edit, added, removed)."""
+    fc = finder.FindChanges
+    (edit1, added1, removed1), (edit2, added2, removed2) = first, second
+
+    def Run(calls):
+        for _ in xrange(calls // 2):
+            edit1()
+            fc(added1, removed1)
+            edit2()
+            fc(added2, removed2)
+
+    def Bare(calls):
+        for _ in xrange(calls // 2):
+            edit1()
+            edit2()
+    return Run, Bare
 
 
-class Timer(object):
-    def __init__(self, finder):
-        self.finder = finder
-
-    def __call__(self, added, removed):
-        start = time.time()
-        self.finder.FindChanges(added, removed)
-        return (time.time() - start) * 1e6
-
-
-def TimeTyping(lst, call, at, reps):
+def Typing(lst, finder, at):
     i = Find(lst, at, IsBodyStatement)
-    samples = []
-    for _ in range(reps):
-        old = lst[i]
-        new = lst[i] = Typed(old)
-        samples.append(call([new], [old]))
-        back = lst[i] = Untyped(new)
-        samples.append(call([back], [new]))
-    return samples
+    old, new = lst[i], Typed(lst[i])
+
+    def Put(logical):
+        def Do():
+            lst[i] = logical
+        return Do
+    return Pair(finder, (Put(new), [new], [old]), (Put(old), [old], [new]))
 
 
-def InsertAndRemove(lst, i, logical, call):
-    """Inserts a logical before index i, then removes it again: the costs of
-    both FindChanges calls."""
-    Shift(lst, i, 1)
-    lst.insert(i, logical)
-    inserted = call([logical], [])
-    del lst[i]
-    Shift(lst, i, -1)
-    return inserted, call([], [logical])
+def InAndOut(lst, finder, i, logical):
+    def Insert():
+        lst.insert(i, logical)
+
+    def Delete():
+        del lst[i]
+    return Pair(finder, (Insert, [logical], []), (Delete, [], [logical]))
 
 
-def TimeDefLine(lst, call, at, reps):
-    i = Find(lst, at, IsMethodHeader)
-    inserted, removed = [], []
-    for _ in range(reps):
-        ref = lst[i]
-        header = LogicalLineType(('def', 'zz_bench', '(', 'self', ')', ':'), ref.fLineno,
-                                 ref.fIndent, kDefKind)
-        cost_in, cost_out = InsertAndRemove(lst, i, header, call)
-        inserted.append(cost_in)
-        removed.append(cost_out)
-    return inserted, removed
+def Header(lst, i, name):
+    ref = lst[i]
+    # The line number before the next line's is free (see benchkit).
+    return LogicalLineType(('def', name, '(', 'self', ')', ':'), ref.fLineno - 1, ref.fIndent, kDefKind)
 
 
-def TimeComment(lst, call, at, reps):
-    """A comment line typed above a method header, then deleted."""
-    i = Find(lst, at, IsMethodHeader)
-    samples = []
-    for _ in range(reps):
-        ref = lst[i]
-        comment = LogicalLineType(('# note',), ref.fLineno, ref.fIndent, 21)
-        samples.extend(InsertAndRemove(lst, i, comment, call))
-    return samples
+def DefLine(lst, finder, at):
+    i = Find(lst, at, IsHeader('add'))
+    return InAndOut(lst, finder, i, Header(lst, i, 'zz_bench'))
 
 
-def TimeBatch(lst, call, at, reps):
-    first = Find(lst, at, IsBodyStatement)
-    targets = [first]
+def RepeatedDef(lst, finder, at):
+    # Named like the class's `total`, which follows: that method becomes
+    # total#1 and its body is renamed, then back.
+    i = Find(lst, at, IsHeader('add'))
+    return InAndOut(lst, finder, i, Header(lst, i, 'total'))
+
+
+def Comment(lst, finder, at):
+    i = Find(lst, at, IsHeader('add'))
+    ref = lst[i]
+    return InAndOut(lst, finder, i, LogicalLineType(('# note',), ref.fLineno - 1, ref.fIndent, kCommentKind))
+
+
+def Batch(lst, finder, at):
+    targets = [Find(lst, at, IsBodyStatement)]
     while len(targets) < 3:
         targets.append(Find(lst, targets[-1] + 6, IsBodyStatement))
-    where = Find(lst, targets[-1] + 1, IsMethodHeader)
-    samples = []
-    for _ in range(reps):
-        olds = [lst[i] for i in targets]
-        news = [Typed(l) for l in olds]
+    where = Find(lst, targets[-1] + 1, IsHeader('total'))
+    olds = [lst[i] for i in targets]
+    news = [Typed(l) for l in olds]
+    ref = lst[where]
+    comment = LogicalLineType(('# batch',), ref.fLineno - 1, ref.fIndent, kCommentKind)
+
+    def Apply():
         for i, l in zip(targets, news):
             lst[i] = l
-        ref = lst[where]
-        comment = LogicalLineType(('# batch',), ref.fLineno, ref.fIndent, 21)
-        Shift(lst, where, 1)
         lst.insert(where, comment)
-        samples.append(call(news + [comment], olds))
 
+    def Undo():
         del lst[where]
-        Shift(lst, where, -1)
-        backs = [Untyped(l) for l in news]
-        for i, l in zip(targets, backs):
+        for i, l in zip(targets, olds):
             lst[i] = l
-        samples.append(call(backs, news + [comment]))
-    return samples
+    return Pair(finder, (Apply, news + [comment], olds), (Undo, olds, news + [comment]))
 
 
-def Median(values):
-    values = sorted(values)
-    return values[len(values) // 2] if values else 0.0
+kMakers = {'typing': Typing, 'def': DefLine, 'repeated def': RepeatedDef, 'comment': Comment, 'batch': Batch}
+
+
+def TimeEdit(maker, lst, finder, at, batches, calls):
+    run, bare = maker(lst, finder, at)
+    run(calls)  # warm up
+    caller = Spread(TimeBatches(bare, batches, calls))[0]
+    return [(t - caller) * 1e6 for t in TimeBatches(run, batches, calls)]
 
 
 def NamesAgree(lst):
-    fresh = WholePass([Clone(l) for l in lst])
-    return all(Names(a) == Names(b) for a, b in zip(lst, fresh))
+    fresh = [LogicalLineType(l.fTokens, l.fLineno, l.fIndent, l.fKind) for l in lst]
+    CChangeFinder(fresh).FindChanges(fresh, [])
+    return all((a.fScopeName, a.fLocalScopeName) == (b.fScopeName, b.fLocalScopeName)
+               for a, b in zip(lst, fresh))
 
 
-def Bench(size, reps, progress):
-    text = Synthesise(size)
-    lst = ReadLogicals(text)
-    finder = CChangeFinder(lst)
-    start = time.time()
-    finder.FindChanges(lst, [])
-    whole = (time.time() - start) * 1e6
-    call = Timer(finder)
+def Bench(size, batches, calls):
+    lst, finder = benchkit.NamedList(size)
     rows = {}
     for place, fraction in kPlaces:
-        # The batch reaches about 30 logicals further.
-        at = max(0, min(int(len(lst) * fraction), len(lst) - 60))
-        inserted, removed = TimeDefLine(lst, call, at, reps)
-        rows[place] = {
-            'typing': Median(TimeTyping(lst, call, at, reps)),
-            'insert def': Median(inserted),
-            'remove def': Median(removed),
-            'comment': Median(TimeComment(lst, call, at, reps)),
-            'batch': Median(TimeBatch(lst, call, at, reps)),
-        }
-        progress.Step()
-    return len(lst), whole, rows, NamesAgree(lst)
+        at = max(0, min(int(len(lst) * fraction), len(lst) - 80))
+        for edit in kEdits:
+            rows[place, edit] = TimeEdit(kMakers[edit], lst, finder, at, batches, calls)
+    return len(lst), rows, NamesAgree(lst)
 
 
 def main(argv=None):
     parser = argparse.ArgumentParser(description=__doc__.splitlines()[0])
     parser.add_argument('--sizes', default='1000,10000,100000',
                         help='approximate logicals per file, comma separated')
-    parser.add_argument('--reps', type=int, default=31, help='repetitions per cell')
+    parser.add_argument('--batches', type=int, default=15, help='batches per cell')
+    parser.add_argument('--calls', type=int, default=2000, help='FindChanges calls per batch')
     args = parser.parse_args(argv)
-    sizes = [int(s) for s in args.sizes.split(',')]
+    results = [Bench(int(s), args.batches, args.calls) for s in args.sizes.split(',')]
 
-    results = []
-    with Progress(len(sizes) * len(kPlaces), 'places') as progress:
-        for size in sizes:
-            results.append(Bench(size, args.reps, progress))
-
-    print 'Median cost of one FindChanges call, microseconds (%d edits and %d undos each;' % (
-        args.reps, args.reps)
-    print 'time.time() ticks in whole microseconds, so the smallest cells are coarse)'
-
-    header = '%-9s %-7s' % ('logicals', 'place') + ''.join('%12s' % e for e in kEdits)
-    print header
-    print '-' * len(header)
-    for count, whole, rows, agree in results:
+    print('Microseconds per FindChanges call, median [10th-90th percentile] over %d batches of %d calls'
+          % (args.batches, args.calls))
+    print('%-9s %-7s' % ('logicals', 'place') + ''.join('%-22s' % e for e in kEdits))
+    for count, rows, agree in results:
         for place, _ in kPlaces:
-            print '%-9d %-7s' % (count, place) + ''.join(
-                '%12.1f' % rows[place][e] for e in kEdits)
-    print
-    for count, whole, rows, agree in results:
-        print '%d logicals: whole-file pass %.0f us; names after the edits %s a fresh pass' % (
-            count, whole, 'agree with' if agree else 'DISAGREE with')
+            print('%-9d %-7s' % (count, place) + ''.join(
+                '%-22s' % FormatSpread(rows[place, e]) for e in kEdits))
     if len(results) > 1:
         small, large = results[0], results[-1]
-        print
-        print 'typing cost ratio, %d vs %d logicals:' % (large[0], small[0]),
-        print ', '.join('%s %.1fx' % (place, large[2][place]['typing'] /
-                                      max(small[2][place]['typing'], 0.1))
-                        for place, _ in kPlaces)
-    print 'peak memory (ru_maxrss): %.1f MB' % (
-        resource.getrusage(resource.RUSAGE_SELF).ru_maxrss / 1024.0)
-    return 0 if all(r[3] for r in results) else 1
+        print('\nratio of medians, %d vs %d logicals:' % (large[0], small[0]))
+        for place, _ in kPlaces:
+            print('  %-7s ' % place + ', '.join(
+                '%s %.2fx' % (e, Spread(large[1][place, e])[0] / max(Spread(small[1][place, e])[0], 1e-3))
+                for e in kEdits))
+    for count, rows, agree in results:
+        print('%d logicals: names after the edits %s a fresh pass' % (count, 'agree with' if agree else
+                                                                        'DISAGREE with'))
+    print('peak memory (ru_maxrss): %.1f MiB' % benchkit.PeakRssMiB())
+    return 0 if all(r[2] for r in results) else 1
 
 
 if __name__ == '__main__':
-    toolpath.RunMain(main)
+    sys.exit(main())

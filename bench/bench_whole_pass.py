@@ -1,99 +1,145 @@
 #!/usr/bin/env python2.7
 """Cost of the change finder's whole-file pass over the standard library.
 
-    bench_whole_pass.py [--repeat N] [ROOT]
+    bench_whole_pass.py [--rounds N] [ROOT]
 
-Reads every file's logicals first, then times only the FindChanges(lst, [])
-calls, and prints ns per logical next to the cost of a bare Python loop that
-reads one field of each logical: the floor that touching those logicals from
-Python costs. Takes the best of N rounds (default 3).
+Every file is read into logicals first; then only the FindChanges(lst, [])
+calls are timed, with a new finder for each file as a caller that has just
+read it would have. Two cases, reported separately:
+
+  cold  freshly read logicals that carry no names yet (a copy made for each
+        round before it is timed);
+  warm  logicals that already carry the names of an earlier pass.
+
+Beside them, a Python loop that only reads one field of each logical: the
+floor that touching those logicals from Python costs. Figures are ns per
+logical, medians over rounds with the 10th-90th percentile spread. Then the
+memory the definition index keeps per logical (measured in two child
+processes that read the same files and keep their finders, one with the
+index and one whose finder takes the table walk instead) and the peak RSS.
 """
+
+from __future__ import print_function
 
 import argparse
 import gc
+import json
 import os
-import resource
+import subprocess
 import sys
-import time
 
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.dirname(os.path.abspath(__file__))), 'tools'))
-import toolpath  # noqa: E402
-from progress import Progress  # noqa: E402
+import benchkit
+from benchkit import CChangeFinder, Clock, FormatSpread, LogicalLineType, ReadLogicals
 
-toolpath.setup()
-
-from pysource.logicals import ReadLogicals  # noqa: E402
-from pysource.scopebodycache import CChangeFinder  # noqa: E402
-
-StdlibFiles = toolpath.StdlibFiles
+from progress import Progress
+import toolpath
 
 
 def ReadAll(paths):
     lists = []
-    with Progress(len(paths), 'files read') as progress:
-        for done, path in enumerate(paths):
-            progress.Show(done)
+    with Progress(len(paths)) as progress:
+        for path in paths:
             try:
                 with open(path, 'rU') as f:
                     lists.append(ReadLogicals(f.read(), path))
             except (SyntaxError, IOError):
                 pass
+            progress.Step()
     return lists
 
 
+def Fresh(lst):
+    return [LogicalLineType(l.fTokens, l.fLineno, l.fIndent, l.fKind) for l in lst]
+
+
 def TimePass(lists):
-    # A fresh finder per file, as a caller that has just read the file would.
     finders = [CChangeFinder(lst) for lst in lists]
-    start = time.time()
-    for cf, lst in zip(finders, lists):
-        cf.FindChanges(lst, [])
-    return time.time() - start
+    start = Clock()
+    for finder, lst in zip(finders, lists):
+        finder.FindChanges(lst, [])
+    return Clock() - start
 
 
 def TimeTouch(lists):
-    start = time.time()
+    start = Clock()
     for lst in lists:
         for l in lst:
             l.fIndent
-    return time.time() - start
+    return Clock() - start
 
 
-def Counted(count, progress):
-    for k in range(count):
-        yield k
-        progress.Step()
+class TableWalk(CChangeFinder):
+    """Overrides a step, so it takes the table walk and keeps no index."""
+
+    def _Clear(self):
+        CChangeFinder._Clear(self)
+
+
+def MemoryChild(root, finder_class):
+    """Run in a child: the native memory (bytes) that keeping a named finder
+    per file adds."""
+    lists = ReadAll(toolpath.StdlibFiles(root))
+    for lst in lists:
+        TableWalk(lst).FindChanges(lst, [])  # every name made before measuring
+    gc.collect()
+    before = benchkit.MallocInUse()
+    finders = []
+    for lst in lists:
+        finder = finder_class(lst)
+        finder.FindChanges(lst, [])
+        finders.append(finder)
+    gc.collect()
+    return {'grown': benchkit.MallocInUse() - before, 'logicals': sum(len(l) for l in lists)}
+
+
+def IndexBytesPerLogical(root):
+    figures = {}
+    for name in ('CChangeFinder', 'TableWalk'):
+        out = subprocess.check_output([sys.executable, os.path.abspath(__file__), '--memory-child', name, root])
+        figures[name] = json.loads(out.decode('ascii').strip().splitlines()[-1])
+    extra = figures['CChangeFinder']['grown'] - figures['TableWalk']['grown']
+    return float(extra) / figures['CChangeFinder']['logicals']
 
 
 def main(argv=None):
     parser = argparse.ArgumentParser(prog='bench_whole_pass.py')
     parser.add_argument('root', nargs='?', default=toolpath.StdlibDir(),
                         help='directory of .py files (default: the standard library)')
-    parser.add_argument('--repeat', type=int, default=3, metavar='N')
+    parser.add_argument('--rounds', type=int, default=7, metavar='N')
+    parser.add_argument('--memory-child', metavar='CLASS', help=argparse.SUPPRESS)
     args = parser.parse_args(argv)
+    if args.memory_child:
+        finder_class = TableWalk if args.memory_child == 'TableWalk' else CChangeFinder
+        print(json.dumps(MemoryChild(args.root, finder_class)))
+        return 0
 
-    lists = ReadAll(StdlibFiles(args.root))
+    lists = ReadAll(toolpath.StdlibFiles(args.root))
     count = sum(len(lst) for lst in lists)
     if not count:
         print('no logicals under %s' % args.root)
         return 1
+    cold, warm, touch = [], [], []
     gc.disable()  # collections would land in whichever loop triggers them
     try:
-        with Progress(2 * args.repeat, 'rounds') as progress:
-            passes = min(TimePass(lists) for _ in Counted(args.repeat, progress))
-            touches = min(TimeTouch(lists) for _ in Counted(args.repeat, progress))
+        for _ in range(args.rounds):
+            fresh = [Fresh(lst) for lst in lists]
+            cold.append(TimePass(fresh) * 1e9 / count)
+            warm.append(TimePass(fresh) * 1e9 / count)
+            touch.append(TimeTouch(fresh) * 1e9 / count)
+            del fresh
     finally:
         gc.enable()
-    rss = resource.getrusage(resource.RUSAGE_SELF).ru_maxrss / 1024.0  # KiB on Linux
 
     print('files:              %d (%s)' % (len(lists), args.root))
     print('logicals:           %d' % count)
-    print('whole-file pass:    %.3f s  %7.1f ns/logical  (best of %d)'
-          % (passes, passes * 1e9 / count, args.repeat))
-    print('touch-each loop:    %.3f s  %7.1f ns/logical' % (touches, touches * 1e9 / count))
-    print('ratio pass/touch:   %.2f' % (passes / touches if touches else float('inf')))
-    print('peak memory (RSS):  %.1f MiB' % rss)
+    print('ns per logical, median [10th-90th percentile] over %d rounds:' % args.rounds)
+    print('  whole-file pass, cold (fresh logicals):  %s' % FormatSpread(cold, digits=1))
+    print('  whole-file pass, warm (named logicals):  %s' % FormatSpread(warm, digits=1))
+    print('  touch-each Python loop:                  %s' % FormatSpread(touch, digits=1))
+    print('definition index:   %.1f bytes per logical' % IndexBytesPerLogical(args.root))
+    print('peak memory (RSS):  %.1f MiB' % benchkit.PeakRssMiB())
     return 0
 
 
 if __name__ == '__main__':
-    toolpath.RunMain(main)
+    sys.exit(main())

@@ -175,15 +175,22 @@ sys.stdout.write('RESULT %r\n' % (result,))
 '''
 
 
+def RunPython(code, env=None):
+    """Runs `code` in a fresh interpreter with this one's path and -O:
+    (status, stdout, stderr)."""
+    env = dict(env or os.environ, PYTHONPATH=os.pathsep.join(p for p in sys.path if p))
+    proc = subprocess.Popen([sys.executable] + ['-O'] * OPTIMIZED + ['-c', textwrap.dedent(code)], env=env,
+                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, universal_newlines=True)
+    out, err = proc.communicate()
+    return proc.returncode, out, err
+
+
 def ImportWith(setup, after=''):
     """In a fresh interpreter with this one's path and -O, imports the module
     after `setup` and runs `after`; returns the child's `result` dict."""
     code = kImportPrelude.replace('#SETUP', textwrap.dedent(setup)).replace('#AFTER', textwrap.dedent(after))
-    env = dict(os.environ, PYTHONPATH=os.pathsep.join(p for p in sys.path if p))
-    proc = subprocess.Popen([sys.executable] + ['-O'] * OPTIMIZED + ['-c', code], env=env,
-                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, universal_newlines=True)
-    out, err = proc.communicate()
+    status, out, err = RunPython(code)
     lines = [l for l in out.splitlines() if l.startswith('RESULT ')]
-    if proc.returncode != 0 or len(lines) != 1:
-        raise RuntimeError('the child failed: %r' % ((proc.returncode, out, err),))
+    if status != 0 or len(lines) != 1:
+        raise RuntimeError('the child failed: %r' % ((status, out, err),))
     return ast.literal_eval(lines[0][len('RESULT '):])

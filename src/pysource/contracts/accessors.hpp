@@ -67,12 +67,15 @@ inline PyObject* definedToken(const Logical* l) noexcept {
     const bool isDef = l->fKind == kDefLogical;
     if (!isDef && l->fKind != kClassLogical) return nullptr;
     const char* keyword = isDef ? "def" : "class";
+    // Compared up to the first NUL, as the bytes of a C string.
+    auto is = [](const char* text, const char* word) { return std::strcmp(text, word) == 0; };
     for (Py_ssize_t i = 0; i < l->fTokenCount; ++i) {
         PyObject* token = l->fTokens[i];
         if (PyString_Check(token)) {
             const char* text = PyString_AS_STRING(token);
-            if (text[0] == '\\' || std::strcmp(text, keyword) == 0) continue;
-            if (isDef && std::strcmp(text, "async") == 0) continue;
+            if (text[0] == '\\') continue;
+            if (text[0] == keyword[0] && is(text, keyword)) continue;
+            if (isDef && text[0] == 'a' && is(text, "async")) continue;
         }
         return token;
     }

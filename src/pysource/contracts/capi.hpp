@@ -27,6 +27,7 @@ inline constexpr const char* kIndexForLineno = "Py_ssize_t (PyObject *, long)";
 inline constexpr const char* kFindIndexOfLogical = "Py_ssize_t (PyObject *, PyObject *)";
 inline constexpr const char* kLeafScopeNameHasIndex = "int (PyObject *)";
 inline constexpr const char* kScopeNameSuffix = "Py_ssize_t (PyObject *, Py_ssize_t *)";
+inline constexpr const char* kScopeNameParentLength = "Py_ssize_t (PyObject *)";
 }  // namespace sig
 
 // pysource._fastaccess. IndexForLineno: -1 with an exception set on
@@ -41,6 +42,11 @@ using FindIndexOfLogicalFn = Py_ssize_t (*)(PyObject* list, PyObject* logical);
 // is set to the length of the name without its suffix.
 using LeafScopeNameHasIndexFn = int (*)(PyObject* name);
 using ScopeNameSuffixFn = Py_ssize_t (*)(PyObject* name, Py_ssize_t* bareLength);
+// ScopeNameParentLength: where SplitScopeNames would cut a full name's last
+// part off, without building the parts: the length of the text before the
+// last part's separator (the parts before it joined with "."), -1 when the
+// name has one part, -2 when it is not a str.
+using ScopeNameParentLengthFn = Py_ssize_t (*)(PyObject* full);
 inline constexpr Py_ssize_t kSuffixTooLarge = -2;
 
 // Function entry points of pysource.symbolinfo. The trailing flag tells the

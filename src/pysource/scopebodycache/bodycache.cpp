@@ -141,6 +141,8 @@ py::Ref indexBody(PyObject* body) {
 py::Ref findInIndexedBody(PyObject* self, PyObject* scopeName, PyObject* body, PyObject* leaf, bool* absent) {
     *absent = false;
     if (!PyString_CheckExact(scopeName) || !PyString_CheckExact(leaf) || !PyList_CheckExact(body)) return {};
+    // A short body is scanned faster than an index is built.
+    if (PyList_GET_SIZE(body) < 16) return {};
     BodyCacheState& s = bodyCacheState(self);
     if (s.bodyIndexes == nullptr) s.bodyIndexes = py::check(PyDict_New()).release();
     py::Ref indexes = py::Ref::own(s.bodyIndexes);
@@ -198,12 +200,33 @@ py::Ref parentScopeName(PyObject* parts, Py_ssize_t count) {
     return py::check(PyObject_CallMethodObjArgs(gNames.dot, gNames.join, ancestors.get(), nullptr));
 }
 
-py::Ref findScopeDef(PyObject* self, PyObject* scopeName) {
-    if (py::checkSize(PyObject_Size(scopeName)) == 0) return py::Ref::none();
+// The parent's name and the leaf of a full name, as SplitScopeNames and the
+// join of all but the last part give them.
+void splitParent(PyObject* scopeName, py::Ref* parentName, py::Ref* leafName) {
+    const Py_ssize_t cut = gNative.scopeNameParentLength != nullptr && PyString_CheckExact(scopeName)
+                               ? gNative.scopeNameParentLength(scopeName)
+                               : -2;
+    if (cut == -1) {
+        *parentName = py::Ref::own(gNames.empty);
+        *leafName = py::Ref::own(scopeName);
+        return;
+    }
+    if (cut >= 0) {
+        const char* text = PyString_AS_STRING(scopeName);
+        *parentName = py::check(PyString_FromStringAndSize(text, cut));
+        *leafName = py::check(PyString_FromStringAndSize(text + cut + 1, PyString_GET_SIZE(scopeName) - cut - 1));
+        return;
+    }
     py::Ref parts = splitScopeNames(scopeName);
     const Py_ssize_t count = py::checkSize(PyObject_Size(parts.get()));
-    py::Ref parentName = parentScopeName(parts.get(), count);
-    py::Ref leafName = py::check(PySequence_GetItem(parts.get(), -1));
+    *parentName = parentScopeName(parts.get(), count);
+    *leafName = py::check(PySequence_GetItem(parts.get(), -1));
+}
+
+py::Ref findScopeDef(PyObject* self, PyObject* scopeName) {
+    if (py::checkSize(PyObject_Size(scopeName)) == 0) return py::Ref::none();
+    py::Ref parentName, leafName;
+    splitParent(scopeName, &parentName, &leafName);
     py::Ref parentBody = callMethod(self, gNames.GetBodyOfScope, parentName.get(), getBodyOfScope);
 
     bool absent = false;

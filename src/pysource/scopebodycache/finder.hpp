@@ -115,8 +115,9 @@ struct FinderState {
 // scopes-seen table (which stays None; nothing can look at it during the
 // call). Where the index cannot be used, the table walk takes over.
 struct NativePass {
-    DefIndex* index = nullptr;    // the finder's index, or null: the table walk
-    bool indexBuilt = false;      // false: rebuild from the list at first use
+    // False once the index was dropped in this call: the table walk then.
+    // While true, a finder without an index builds one at its first use.
+    bool indexUsable = true;
     DefIndex* dropped = nullptr;  // dropped during the call; freed at its end
 };
 
@@ -151,6 +152,11 @@ void dropDefinitionIndex(PyObject* self) noexcept;
 // the list (SystemError when they differ): the self-check of the replay,
 // turned on by SBC_CHECK_INDEX=1 in the environment at import.
 extern bool gCheckDefinitionIndex;
+// When set (SBC_TRACE_INDEX=1), the index's life is written to stderr, a
+// line per event ("definition index built", "... rebuilt", "... dropped"),
+// for the tests of that life.
+extern bool gTraceDefinitionIndex;
+void traceDefinitionIndex(const char* event) noexcept;
 // The native pass keeps the index in step with the names it stores: a
 // class/def logical at `i` filed under its stored names, or taken out.
 void fileDefinition(PyObject* self, PyObject* logical, Py_ssize_t i);

@@ -3,6 +3,8 @@
 #include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
+#include <algorithm>
+
 namespace sbc::finder {
 
 using namespace contracts;
@@ -15,6 +17,23 @@ py::Ref ProcessRemovedLogicals(PyObject* self, PyObject* removedList) {
     return result;
 }
 
+namespace {
+
+// Whether `logical` stands among the logicals of its own line number from
+// `index` on.
+bool standsAt(PyObject* self, PyObject* logical, Py_ssize_t index) {
+    PyObject* list = finderState(self).logicalList;
+    const int32_t lineno = asLogical(logical)->fLineno;
+    for (Py_ssize_t j = std::max<Py_ssize_t>(index, 0); j < PyList_GET_SIZE(list); ++j) {
+        PyObject* item = PyList_GET_ITEM(list, j);
+        if (item == logical) return true;
+        if (!logicalCheck(item) || asLogical(item)->fLineno != lineno) return false;
+    }
+    return false;
+}
+
+}  // namespace
+
 void processRemoved(PyObject* self, PyObject* removedList, IndexList& result) {
     const bool native = nativePass(self);
     Py_ssize_t lastIndex = -1;
@@ -22,14 +41,14 @@ void processRemoved(PyObject* self, PyObject* removedList, IndexList& result) {
         LogicalRef logical = LogicalRef::own(PyList_GET_ITEM(removedList, k));
         py::Ref scope = py::Ref::own(scopeName(logical.record()));
         if (scope.isNone()) continue;
-        // One still in the list (a caller's mistake) keeps its place in the
-        // definition index, as the table walk would still count it.
-        if (native && isScopeStart(logical.record()) &&
-            findIndexOfLogical(finderState(self).logicalList, logical.get(), true) < 0) {
-            unfileDefinition(self, logical.get());
-        }
         route::LogicalInScopeChanged(self, logical.get(), scope.get());
         Py_ssize_t index = indexForLineno(finderState(self).logicalList, logical->fLineno, native);
+        // One still in the list (a caller's mistake) keeps its place in the
+        // definition index, as the table walk would still count it. Where
+        // its line number leads is where it would be.
+        if (native && isScopeStart(logical.record()) && !standsAt(self, logical.get(), index)) {
+            unfileDefinition(self, logical.get());
+        }
         // A logical removed from the end of the list still moves the comment
         // and blank lines before it (they took their scope from it): the last
         // logical stands in its place.

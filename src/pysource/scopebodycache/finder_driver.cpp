@@ -287,20 +287,17 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
         IndexList list(&indices);
         if (added == total) {
             dropDefinitionIndex(self);
+            pass.indexUsable = true;
             processRemoved(self, removedList, list);
             // The whole-list pass counts every definition into a new index.
             s.defIndex = new DefIndex(s.logicalList);
-            pass.index = s.defIndex;
-            pass.indexBuilt = true;
+            traceDefinitionIndex("built");
             FindChangesEntireListAdded(self);
         } else {
-            const bool matches = indexStillMatches(s, added, PyList_GET_SIZE(removedList));
-            if (!matches) {
+            if (!indexStillMatches(s, added, PyList_GET_SIZE(removedList))) {
                 dropDefinitionIndex(self);
-                s.defIndex = new DefIndex(s.logicalList);
+                pass.indexUsable = true;  // built afresh when first needed
             }
-            pass.index = s.defIndex;
-            pass.indexBuilt = matches;
             if (!ProcessTypedLine(self, addedList, removedList)) {
                 processRemoved(self, removedList, list);
                 processAdded(self, addedList, list);
@@ -309,7 +306,7 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
         }
         result = resultTuple(s);
         // Kept for the next call only if it is known to match the list.
-        if (s.defIndex != nullptr && (!pass.indexBuilt || s.defIndex->hasCandidates())) {
+        if (s.defIndex != nullptr && s.defIndex->hasCandidates()) {
             dropDefinitionIndex(self);
         }
         if (s.defIndex != nullptr) {

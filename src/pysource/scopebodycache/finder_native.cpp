@@ -5,10 +5,16 @@
 #include "pysource/scopebodycache/finder.hpp"
 
 #include <algorithm>
+#include <memory>
 
 namespace sbc {
 
 bool gCheckDefinitionIndex = false;
+bool gTraceDefinitionIndex = false;
+
+void traceDefinitionIndex(const char* event) noexcept {
+    if (gTraceDefinitionIndex) PySys_WriteStderr("definition index %s\n", event);
+}
 
 int FinderState::traverseInternal(visitproc visit, void* arg) const {
     return defIndex != nullptr ? defIndex->traverse(visit, arg) : 0;
@@ -23,10 +29,11 @@ void FinderState::clearInternal() noexcept {
 void dropDefinitionIndex(PyObject* self) noexcept {
     FinderState& s = finderState(self);
     if (s.defIndex == nullptr) return;
-    if (s.native != nullptr && s.native->index == s.defIndex) {
+    traceDefinitionIndex("dropped");
+    if (s.native != nullptr) {
         // The pass may be inside a step that holds it: it goes when the
-        // call ends.
-        s.native->index = nullptr;
+        // call ends, and the call goes on with the table walk.
+        s.native->indexUsable = false;
         delete s.native->dropped;
         s.native->dropped = s.defIndex;
         s.defIndex = nullptr;
@@ -38,15 +45,17 @@ void dropDefinitionIndex(PyObject* self) noexcept {
 DefIndex* definitionIndex(PyObject* self) {
     FinderState& s = finderState(self);
     NativePass* pass = s.native;
-    if (pass == nullptr || pass->index == nullptr) return nullptr;
-    if (!pass->indexBuilt) {
-        pass->indexBuilt = true;
-        if (!pass->index->rebuild()) {
-            dropDefinitionIndex(self);
+    if (pass == nullptr || !pass->indexUsable) return nullptr;
+    if (s.defIndex == nullptr) {
+        auto index = std::make_unique<DefIndex>(s.logicalList);
+        if (!index->rebuild()) {
+            pass->indexUsable = false;  // never usable: nothing to drop
             return nullptr;
         }
+        s.defIndex = index.release();
+        traceDefinitionIndex("rebuilt");
     }
-    return pass->index;
+    return s.defIndex;
 }
 
 void fileDefinition(PyObject* self, PyObject* logical, Py_ssize_t i) {
@@ -59,8 +68,8 @@ void fileDefinition(PyObject* self, PyObject* logical, Py_ssize_t i) {
 void unfileDefinition(PyObject* self, PyObject* logical) {
     FinderState& s = finderState(self);
     // Before the first use the index is rebuilt from the list anyway.
-    if (s.native == nullptr || s.native->index == nullptr || !s.native->indexBuilt) return;
-    s.native->index->remove(logical);
+    if (s.native == nullptr || !s.native->indexUsable || s.defIndex == nullptr) return;
+    s.defIndex->remove(logical);
 }
 
 // --- The index list -----------------------------------------------------------

@@ -56,6 +56,35 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
     return true;
 }
 
+// The native pass over a stretch of plain lines (the bulk of a file): the
+// loop's own work and _SetLogicalScopeNames, on borrowed records, since
+// nothing here runs Python code but the release of an old name a store
+// replaces (after which the list is read afresh). Stops at a class/def
+// line or a comment run to place, and returns where it stopped.
+Py_ssize_t NamePlainLinesNative(PyObject* self, Py_ssize_t i, std::vector<OpenScope>& stack) {
+    FinderState& s = finderState(self);
+    while (s.logicalList != Py_None && i < PyList_GET_SIZE(s.logicalList)) {
+        Logical* l = requireLogical(PyList_GET_ITEM(s.logicalList, i));
+        const int indent = l->fIndent;
+        if (isScopeStart(l) || (isWhitespace(l) && indent <= stack.back().indent)) return i;
+        while (indent <= stack.back().indent) {
+            if (stack.size() < 2) return i;  // the general loop reports it
+            stack.pop_back();
+        }
+        PyObject* top = stack.back().name.get();
+        PyObject* old = scopeName(l);
+        if (old != top) {
+            requireStrOrNone(old);
+            if (old == Py_None || !strEquals(old, top)) {
+                requireStrOrNone(top);
+                setScopeName(l, top);
+            }
+        }
+        ++i;
+    }
+    return i;
+}
+
 }  // namespace
 
 void FindChangesEntireListAdded(PyObject* self) {
@@ -64,7 +93,10 @@ void FindChangesEntireListAdded(PyObject* self) {
     std::vector<OpenScope> stack;
     stack.push_back({py::Ref::own(gNames.empty), -1});
     Py_ssize_t i = 0;
+    const bool native = nativePass(self);
     while (i < logicalListLength(self)) {
+        if (native) i = NamePlainLinesNative(self, i, stack);
+        if (i >= logicalListLength(self)) break;
         LogicalRef logical = logicalAt(self, i);
         const int indent = logical->fIndent;
         if (isWhitespace(logical.record()) && indent <= stack.back().indent) {

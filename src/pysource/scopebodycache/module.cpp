@@ -95,6 +95,8 @@ void initialize() {
     internStepNames();
     const char* check = std::getenv("SBC_CHECK_INDEX");
     gCheckDefinitionIndex = check != nullptr && check[0] == '1';
+    const char* trace = std::getenv("SBC_TRACE_INDEX");
+    gTraceDefinitionIndex = trace != nullptr && trace[0] == '1';
     readyFunctionType();
     checkBuiltinNames();
 

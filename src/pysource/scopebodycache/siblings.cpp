@@ -205,6 +205,8 @@ void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo) {
         optionalEntry(symbolinfo, "LeafScopeNameHasIndex", sig::kLeafScopeNameHasIndex));
     n.scopeNameSuffix = reinterpret_cast<ScopeNameSuffixFn>(
         optionalEntry(symbolinfo, "ScopeNameSuffix", sig::kScopeNameSuffix));
+    n.scopeNameParentLength = reinterpret_cast<ScopeNameParentLengthFn>(
+        optionalEntry(symbolinfo, "ScopeNameParentLength", sig::kScopeNameParentLength));
     n.fastaccess = py::Ref::own(fastaccess).release();
     n.symbolinfo = py::Ref::own(symbolinfo).release();
     n.indexForLinenoFunction = py::Ref::own(moduleAttribute(fastaccess, gNames.IndexForLineno)).release();

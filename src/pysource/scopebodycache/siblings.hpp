@@ -47,6 +47,7 @@ struct NativeSiblings {
     contracts::FindIndexOfLogicalFn findIndexOfLogical = nullptr;
     contracts::LeafScopeNameHasIndexFn leafScopeNameHasIndex = nullptr;
     contracts::ScopeNameSuffixFn scopeNameSuffix = nullptr;
+    contracts::ScopeNameParentLengthFn scopeNameParentLength = nullptr;  // like SplitScopeNames, bound for good
     PyObject* fastaccess = nullptr;  // the modules bound as globals at import
     PyObject* symbolinfo = nullptr;
     PyObject* indexForLinenoFunction = nullptr;  // their functions then

@@ -307,6 +307,12 @@ PyObject* LeafScopeNameHasIndex(PyObject*, PyObject* name) {
     return py::Ref::own(nativeLeafScopeNameHasIndex(name) ? Py_True : Py_False).release();
 }
 
+Py_ssize_t nativeScopeNameParentLength(PyObject* full) noexcept {
+    if (!PyString_Check(full)) return -2;
+    const size_t dot = view(full).rfind(kDot);
+    return dot == std::string_view::npos ? -1 : static_cast<Py_ssize_t>(dot);
+}
+
 Py_ssize_t nativeScopeNameSuffix(PyObject* name, Py_ssize_t* bareLength) noexcept {
     if (!PyString_Check(name)) {
         *bareLength = 0;
@@ -366,6 +372,9 @@ void publishFunctions(PyObject* capi) {
     siblings::publish(capi, "LeafScopeNameHasIndex", reinterpret_cast<void*>(hasIndex),
                       sig::kLeafScopeNameHasIndex);
     siblings::publish(capi, "ScopeNameSuffix", reinterpret_cast<void*>(suffix), sig::kScopeNameSuffix);
+    ScopeNameParentLengthFn parentLength = nativeScopeNameParentLength;
+    siblings::publish(capi, "ScopeNameParentLength", reinterpret_cast<void*>(parentLength),
+                      sig::kScopeNameParentLength);
 }
 
 void init() {
