@@ -246,6 +246,8 @@ def _ParseArgs(argv):
                         help='write DIR/last_edit.py before every call (for crashes)')
     parser.add_argument('--quiet', action='store_true',
                         help='print only failures and the summary')
+    parser.add_argument('--check-index', action='store_true',
+                        help='compare the definition index with the list after every call')
     return parser.parse_args(argv)
 
 
