@@ -328,6 +328,15 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
 }  // namespace
 
 
+// What a call costs (2-core machine, process CPU time; bench/ reruns it):
+// with nothing to do, 0.22 us, nearly all of it the Python call and the
+// three sets and the tuple it must return; typing a character, 0.32 us at
+// any file size; a method header in or out, about 1 us; a header that
+// renumbers a later namesake and renames its body, about 2 us; the
+// whole-list pass, 93 ns per fresh logical and 49 ns per named one. On an
+// override's route typing costs 1.6-3 us, and a definition edit walks the
+// scopes-seen table over the whole list (about 70 ns per logical).
+//
 // The editor protocol. Between two calls the caller edits the list in place
 // and then passes what it inserted (added_list) and what it took out
 // (removed_list). A removed logical is mapped to the place it left by its
