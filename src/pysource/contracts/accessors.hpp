@@ -8,6 +8,7 @@
 #include "pysource/contracts/logical_record.hpp"
 
 #include <cstring>
+#include <string_view>
 
 namespace contracts {
 
@@ -66,16 +67,22 @@ inline void setScopeName(Logical* l, PyObject* name) noexcept { py::storeSlot(&l
 inline PyObject* definedToken(const Logical* l) noexcept {
     const bool isDef = l->fKind == kDefLogical;
     if (!isDef && l->fKind != kClassLogical) return nullptr;
-    const char* keyword = isDef ? "def" : "class";
-    // Compared up to the first NUL, as the bytes of a C string.
-    auto is = [](const char* text, const char* word) { return std::strcmp(text, word) == 0; };
+    const std::string_view keyword = isDef ? "def" : "class";
+    // Compared up to the first NUL, as the bytes of a C string: equal when
+    // the token is the word, or the word followed by a NUL.
+    auto is = [](PyObject* token, std::string_view word) {
+        const auto size = static_cast<size_t>(PyString_GET_SIZE(token));
+        const char* text = PyString_AS_STRING(token);
+        return size >= word.size() && (size == word.size() || text[word.size()] == '\0') &&
+               std::memcmp(text, word.data(), word.size()) == 0;
+    };
     for (Py_ssize_t i = 0; i < l->fTokenCount; ++i) {
         PyObject* token = l->fTokens[i];
         if (PyString_Check(token)) {
             const char* text = PyString_AS_STRING(token);
             if (text[0] == '\\') continue;
-            if (text[0] == keyword[0] && is(text, keyword)) continue;
-            if (isDef && text[0] == 'a' && is(text, "async")) continue;
+            if (text[0] == keyword[0] && is(token, keyword)) continue;
+            if (isDef && text[0] == 'a' && is(token, "async")) continue;
         }
         return token;
     }
@@ -113,6 +120,10 @@ private:
 inline bool strEquals(PyObject* a, PyObject* b) {
     if (a == b && PyString_CheckExact(a)) return true;
     if (PyString_CheckExact(a) && PyString_CheckExact(b)) {
+        if (PyString_GET_SIZE(a) == PyString_GET_SIZE(b) &&
+            std::memcmp(PyString_AS_STRING(a), PyString_AS_STRING(b), PyString_GET_SIZE(a)) == 0) {
+            return true;
+        }
         return std::strcmp(PyString_AS_STRING(a), PyString_AS_STRING(b)) == 0;
     }
     NameBytes c(b);

@@ -6,6 +6,7 @@
 #include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
+#include <cstring>
 #include <vector>
 
 namespace sbc::finder {
@@ -56,6 +57,11 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
     return true;
 }
 
+bool sameExactStr(PyObject* a, PyObject* b) noexcept {
+    return PyString_CheckExact(a) && PyString_CheckExact(b) && PyString_GET_SIZE(a) == PyString_GET_SIZE(b) &&
+           std::memcmp(PyString_AS_STRING(a), PyString_AS_STRING(b), PyString_GET_SIZE(a)) == 0;
+}
+
 // The native pass over a stretch of plain lines (the bulk of a file): the
 // loop's own work and _SetLogicalScopeNames, on borrowed records, since
 // nothing here runs Python code but the release of an old name a store
@@ -78,6 +84,10 @@ Py_ssize_t NamePlainLinesNative(PyObject* self, Py_ssize_t i, std::vector<OpenSc
             if (old == Py_None || !strEquals(old, top)) {
                 requireStrOrNone(top);
                 setScopeName(l, top);
+            } else if (sameExactStr(old, top)) {
+                // Over a named list the rest of this body then compares
+                // by identity.
+                stack.back().name = py::Ref::own(old);
             }
         }
         ++i;
