@@ -71,8 +71,9 @@ inline PyObject* definedToken(const Logical* l) noexcept {
     auto is = [](const char* text, const char* word) { return std::strcmp(text, word) == 0; };
     for (Py_ssize_t i = 0; i < l->fTokenCount; ++i) {
         PyObject* token = l->fTokens[i];
-        if (PyString_Check(token)) {
-            const char* text = PyString_AS_STRING(token);
+        std::string_view bytes;
+        if (compat::isStr(token) && compat::tryStrView(token, &bytes)) {
+            const char* text = bytes.data();
             if (text[0] == '\\') continue;
             if (text[0] == keyword[0] && is(text, keyword)) continue;
             if (isDef && text[0] == 'a' && is(text, "async")) continue;
@@ -97,8 +98,9 @@ inline void setLocalScopeDefined(Logical* l, PyObject* name) noexcept {
     py::storeSlot(&l->fLocalScopeName, name == Py_None ? nullptr : name);
 }
 
-// The bytes of a name: a str directly, a unicode through the default
-// encoding, a bytearray's buffer; anything else is a TypeError.
+// The bytes of a name: a str directly (its UTF-8 on 3.x), 2.7's unicode
+// through the default encoding, 3.x's bytes as they are, a bytearray's
+// buffer; anything else is a TypeError.
 class NameBytes {
 public:
     explicit NameBytes(PyObject* name);
@@ -111,9 +113,9 @@ private:
 
 // Whether two names have the same bytes up to the first NUL.
 inline bool strEquals(PyObject* a, PyObject* b) {
-    if (a == b && PyString_CheckExact(a)) return true;
-    if (PyString_CheckExact(a) && PyString_CheckExact(b)) {
-        return std::strcmp(PyString_AS_STRING(a), PyString_AS_STRING(b)) == 0;
+    if (a == b && compat::isStrExact(a)) return true;
+    if (compat::isStrExact(a) && compat::isStrExact(b)) {
+        return std::strcmp(compat::strText(a), compat::strText(b)) == 0;
     }
     NameBytes c(b);
     NameBytes s(a);

@@ -119,7 +119,7 @@ PyObject* m_ProcessDedentedComments(PyObject* self, PyObject* const* a) {
     const Py_ssize_t first = py::asIndex(a[0]);
     const Py_ssize_t end = route::builtin<Step::ProcessDedentedComments>(finder::ProcessDedentedComments,
                                                                          self, first);
-    return py::check(PyInt_FromSsize_t(end)).release();
+    return py::check(compat::intFromSsize(end)).release();
 }
 PyObject* m_LogicalInScopeChanged(PyObject* self, PyObject* const* a) {
     dropDefinitionIndex(self);
@@ -155,7 +155,7 @@ PyObject* m_FindScopeIndexForLogical(PyObject* self, PyObject* const* a) {
     const Py_ssize_t i = py::asIndex(a[1]);
     const Py_ssize_t index = route::builtin<Step::FindScopeIndexForLogical>(
         finder::FindScopeIndexForLogical, self, a[0], i);
-    return py::check(PyInt_FromSsize_t(index)).release();
+    return py::check(compat::intFromSsize(index)).release();
 }
 PyObject* m_FindScopeNameContainingLogical(PyObject* self, PyObject* const* a) {
     dropDefinitionIndex(self);

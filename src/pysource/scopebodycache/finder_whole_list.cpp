@@ -28,8 +28,8 @@ struct OpenScope {
 bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t i, PyObject* top,
                           py::Ref* full) {
     DefinedName name;
-    if (!readDefinedName(logical.get(), &name) || !PyString_CheckExact(name.name) ||
-        !PyString_CheckExact(top)) {
+    if (!readDefinedName(logical.get(), &name) || !compat::isStrExact(name.name) ||
+        !compat::isStrExact(top)) {
         return false;
     }
     const Py_ssize_t index = CountDefinition(self, logical.get(), i, top, &name);
@@ -37,7 +37,7 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
     if (name.index == index) {
         local = py::Ref::own(name.name);
     } else {
-        py::Ref number = py::check(PyInt_FromSsize_t(index));
+        py::Ref number = py::check(compat::intFromSsize(index));
         local = appendScopeSuffixes(bareNameOf(logical.get(), name).get(), number.get());
     }
     *full = joinTwoScopeNames(top, local.get());

@@ -42,7 +42,7 @@ PyTypeObject FunctionType = {PyVarObject_HEAD_INIT(nullptr, 0)};
 const char* checkTypeName(ArgCheck check, PyTypeObject** type) {
     switch (check) {
     case ArgCheck::List: *type = &PyList_Type; return "list";
-    case ArgCheck::Str: *type = &PyString_Type; return "str";
+    case ArgCheck::Str: *type = compat::strType(); return "str";
     case ArgCheck::Set: *type = &PySet_Type; return "set";
     case ArgCheck::Any: break;
     }
@@ -51,7 +51,7 @@ const char* checkTypeName(ArgCheck check, PyTypeObject** type) {
 }
 
 int indexOfParam(const FunctionSpec& spec, PyObject* key) {
-    const char* text = PyString_AS_STRING(key);
+    const char* text = compat::strText(key);
     for (int i = 0; i < spec.total; ++i) {
         if (std::strcmp(spec.params[i].name, text) == 0) return i;
     }
@@ -117,7 +117,7 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObj
                 PyObject* value;
                 Py_ssize_t pos = 0;
                 while (PyDict_Next(kwargs, &pos, &key, &value)) {
-                    if (!PyString_Check(key)) {
+                    if (!compat::isStr(key)) {
                         PyErr_Format(PyExc_TypeError, "%.200s() keywords must be strings", spec.name);
                         py::fail();
                     }
@@ -125,13 +125,13 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObj
                     if (at < 0) {
                         PyErr_Format(PyExc_TypeError,
                                      "%.200s() got an unexpected keyword argument '%.200s'",
-                                     spec.name, PyString_AS_STRING(key));
+                                     spec.name, compat::strText(key));
                         py::fail();
                     }
                     if (at < nargs) {
                         PyErr_Format(PyExc_TypeError,
                                      "%s() got multiple values for keyword argument '%s'", spec.name,
-                                     PyString_AS_STRING(key));
+                                     compat::strText(key));
                         py::fail();
                     }
                 }
@@ -164,7 +164,7 @@ PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
             // Reached unbound, the first argument is the instance.
             if (PyTuple_GET_SIZE(args) < 1) {
                 PyErr_Format(PyExc_TypeError, "descriptor '%.200s' needs an argument",
-                             PyString_AS_STRING(f->qualname));
+                             compat::strText(f->qualname));
                 py::fail();
             }
             self = PyTuple_GET_ITEM(args, 0);
@@ -172,7 +172,7 @@ PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
             if (!PyObject_TypeCheck(self, f->owner)) {
                 PyErr_Format(PyExc_TypeError,
                              "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
-                             PyString_AS_STRING(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
+                             compat::strText(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
                 py::fail();
             }
         }
@@ -189,7 +189,7 @@ PyObject* function_descr_get(PyObject* op, PyObject* obj, PyObject* type) {
         return op;
     }
     if (obj == Py_None) obj = nullptr;
-    return PyMethod_New(op, obj, type);
+    return compat::methodFor(op, obj, type);
 }
 
 void function_dealloc(PyObject* op) {
@@ -204,7 +204,9 @@ void function_dealloc(PyObject* op) {
 
 PyObject* function_repr(PyObject* op) {
     auto* f = reinterpret_cast<FunctionObject*>(op);
-    return PyString_FromFormat("<function %s at %p>", PyString_AS_STRING(f->qualname), op);
+    return py::guarded([&] {
+        return compat::strFromFormat("<function %s at %p>", compat::strText(f->qualname), op);
+    });
 }
 
 // Pickled by reference: module and name.
@@ -236,10 +238,10 @@ py::Ref makeFunction(const FunctionSpec& spec, const char* qualname, const char*
     f->isMethod = isMethod;
     f->owner = owner;
     Py_XINCREF(owner);
-    f->name = py::check(PyString_InternFromString(spec.name)).release();
-    f->qualname = py::check(PyString_FromString(qualname)).release();
-    f->module = py::check(PyString_InternFromString(module)).release();
-    f->doc = spec.doc ? py::check(PyString_FromString(spec.doc)).release() : py::Ref::none().release();
+    f->name = py::check(compat::internStr(spec.name)).release();
+    f->qualname = py::check(compat::strFromText(qualname)).release();
+    f->module = py::check(compat::internStr(module)).release();
+    f->doc = spec.doc ? py::check(compat::strFromText(spec.doc)).release() : py::Ref::none().release();
     return op;
 }
 
@@ -265,8 +267,8 @@ py::Ref newFunction(const FunctionSpec& spec, const char* module) {
 py::Ref newMethod(const FunctionSpec& spec, PyTypeObject* owner, const char* module) {
     const char* dot = std::strrchr(owner->tp_name, '.');
     py::Ref qual = py::check(
-        PyString_FromFormat("%s.%s", dot ? dot + 1 : owner->tp_name, spec.name));
-    return makeFunction(spec, PyString_AS_STRING(qual.get()), module, owner);
+        compat::strFromFormat("%s.%s", dot ? dot + 1 : owner->tp_name, spec.name));
+    return makeFunction(spec, compat::strText(qual.get()), module, owner);
 }
 
 void bindMethods(PyTypeObject* type, const FunctionSpec* specs, size_t count, const char* module) {
