@@ -1,7 +1,6 @@
 """Pickling and copying CChangeFinder and CScopeBodyCache."""
 
 import copy
-import cPickle
 import pickle
 import unittest
 
@@ -9,7 +8,7 @@ from pysource import scopebodycache
 from pysource._fastaccess import LogicalLineType
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache
 
-from support import Named, Names, Outcome, Read, WholeListNames
+from support import Named, Names, Outcome, Picklers, Read, WholeListNames
 
 # Module-level names: inside a class body `__pyx_...` would be mangled.
 UnpickleFinder = scopebodycache.__dict__['__pyx_unpickle_CChangeFinder']
@@ -33,13 +32,6 @@ def g():
 SubFinder = type('SubFinder', (CChangeFinder,), {})
 SubCache = type('SubCache', (CScopeBodyCache,), {})
 SubDict = type('SubDict', (dict,), {})
-
-
-def Picklers():
-    """(label, dumps, loads) of every pickling route."""
-    for module in (pickle, cPickle):
-        for proto in (0, 1, 2):
-            yield '%s/%d' % (module.__name__, proto), lambda o, m=module, p=proto: m.dumps(o, p), module.loads
 
 
 def Plain(value):
@@ -136,7 +128,7 @@ class ReduceFormTest(unittest.TestCase):
         self.assertEqual(cf.__reduce__()[2], state)
 
     def testRebuildFunctionsByNameLookedUpAtEachReduce(self):
-        self.assertIn('scopebodycache\n__pyx_unpickle_CChangeFinder', pickle.dumps(CChangeFinder(None), 0))
+        self.assertIn(b'scopebodycache\n__pyx_unpickle_CChangeFinder', pickle.dumps(CChangeFinder(None), 0))
         marker = lambda *args: None  # noqa: E731
         setattr(scopebodycache, '__pyx_unpickle_CScopeBodyCache', marker)
         try:

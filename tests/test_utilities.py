@@ -12,7 +12,8 @@ from pysource.scopebodycache import (
     GetNowTime, IsDefKind, IsScopeStartLogical, IsWhitespaceLogical, LogicalCheck, OutOfTime,
     PySet_InplaceOr, RaiseIfNotLogical, SetLogicalLocalScopeDefined, ULongLongValueForDoubleBits)
 
-from support import CapturedStderr, Logical, Outcome, kBlankKind, kClassKind, kCommentKind, kDefKind
+from support import (CapturedStderr, Logical, OtherText, Outcome, Text, kBlankKind, kClassKind, kCommentKind,
+                     kDefKind, kOtherTextName)
 
 
 SubLogical = type('SubLogical', (LogicalLineType,), {})
@@ -71,9 +72,9 @@ class LogicalTest(unittest.TestCase):
         # None clears it; the tokens count again. A name of another type is refused when read.
         SetLogicalLocalScopeDefined(l, None)
         self.assertEqual((l.fLocalScopeName, GetLocalScopeDefined(Logical(['def', 'f'], kind=kDefKind))), (None, 'f'))
-        for value, type_name in [(5, 'int'), (u'f', 'unicode')]:
+        for value, type_name in [(5, 'int'), (OtherText('f'), kOtherTextName)]:
             SetLogicalLocalScopeDefined(l, value)
-            self.assertEqual(Outcome(GetLocalScopeDefined, l), (TypeError, 'Expected bytes, got %s' % type_name))
+            self.assertEqual(Outcome(GetLocalScopeDefined, l), (TypeError, Text('Expected bytes, got %s', type_name)))
 
 
 class SmallFunctionsTest(unittest.TestCase):
@@ -138,7 +139,7 @@ class SmallFunctionsTest(unittest.TestCase):
         wrong = "Argument 'ibytes' has incorrect type (expected str, got %s)"
         for ibytes, expected in [
                 ('x', plain), (':', plain), ('x:y', plain), (':Fname', ord('F')), (':\xff', -1),
-                (':\0', 0), (u':x', (TypeError, wrong % 'unicode'))]:
+                (':\0', 0), (OtherText(':x'), (TypeError, wrong % kOtherTextName))]:
             self.assertEqual(Outcome(GetInfoBytesKind, ibytes), expected, repr(ibytes))
         with CapturedStderr() as err:
             self.assertEqual(GetInfoBytesKind(None), 0)

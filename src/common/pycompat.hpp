@@ -111,6 +111,26 @@ inline const char* otherTextBytes(PyObject* o, py::Ref* holder) {
 #endif
 }
 
+// The length of a str in characters (bytes on 2.7), and the character at
+// `i` (< length) as a C char: its low 8 bits on 3.x.
+inline Py_ssize_t strLength(PyObject* s) {
+#if PY_MAJOR_VERSION >= 3
+    return py::checkSize(PyUnicode_GetLength(s));
+#else
+    return PyString_GET_SIZE(s);
+#endif
+}
+
+inline char strCharAt(PyObject* s, Py_ssize_t i) {
+#if PY_MAJOR_VERSION >= 3
+    const Py_UCS4 c = PyUnicode_ReadChar(s, i);
+    if (c == static_cast<Py_UCS4>(-1) && PyErr_Occurred()) py::fail();
+    return static_cast<char>(c & 0xFF);
+#else
+    return PyString_AS_STRING(s)[i];
+#endif
+}
+
 // A new str from bytes (UTF-8 on 3.x); null with an exception set.
 inline PyObject* strFromBytes(const char* data, Py_ssize_t size) noexcept {
 #if PY_MAJOR_VERSION >= 3
@@ -398,6 +418,54 @@ inline PyObject* methodFor(PyObject* function, PyObject* obj, PyObject* type) no
     return PyMethod_New(function, obj, type);
 #endif
 }
+
+// Makes a filled-in static type object ready and returns the type to use.
+// 3.x refuses a static type whose base is a heap type (a class written in
+// Python standing in for a native base): it is then made as a heap type
+// with the same slots. `heap` tells which it was; a heap type's instances
+// hold a reference to it on 3.x (see kInstancesOwnHeapType).
+inline PyTypeObject* readyType(PyTypeObject* type, bool* heap) {
+    *heap = false;
+#if PY_MAJOR_VERSION >= 3
+    PyTypeObject* base = type->tp_base;
+    if (base != nullptr && (base->tp_flags & Py_TPFLAGS_HEAPTYPE)) {
+        PyType_Slot slots[16];
+        int n = 0;
+        auto add = [&](int slot, void* value) {
+            if (value != nullptr) slots[n++] = {slot, value};
+        };
+        add(Py_tp_dealloc, reinterpret_cast<void*>(type->tp_dealloc));
+        add(Py_tp_traverse, reinterpret_cast<void*>(type->tp_traverse));
+        add(Py_tp_clear, reinterpret_cast<void*>(type->tp_clear));
+        add(Py_tp_new, reinterpret_cast<void*>(type->tp_new));
+        add(Py_tp_init, reinterpret_cast<void*>(type->tp_init));
+        add(Py_tp_repr, reinterpret_cast<void*>(type->tp_repr));
+        add(Py_tp_call, reinterpret_cast<void*>(type->tp_call));
+        add(Py_tp_descr_get, reinterpret_cast<void*>(type->tp_descr_get));
+        add(Py_tp_methods, type->tp_methods);
+        add(Py_tp_members, type->tp_members);
+        add(Py_tp_getset, type->tp_getset);
+        add(Py_tp_doc, const_cast<char*>(type->tp_doc));
+        slots[n] = {0, nullptr};
+        PyType_Spec spec = {type->tp_name, static_cast<int>(type->tp_basicsize), 0,
+                            static_cast<unsigned int>(type->tp_flags), slots};
+        py::Ref bases = py::check(PyTuple_Pack(1, reinterpret_cast<PyObject*>(base)));
+        PyObject* made = py::check(PyType_FromSpecWithBases(&spec, bases.get())).release();
+        *heap = true;
+        return reinterpret_cast<PyTypeObject*>(made);  // lives as long as the process
+    }
+#endif
+    py::checkStatus(PyType_Ready(type));
+    return type;
+}
+
+// 3.x: an instance of a heap type holds a reference to its type, which the
+// first tp_dealloc that is not the interpreter's own gives back.
+inline constexpr bool kInstancesOwnHeapType = kPython3;
+
+// object.__new__ given arguments for a class that has its own __new__ and
+// __init__: 2.7 warns, 3.x raises TypeError.
+inline constexpr bool kObjectNewRefusesArguments = kPython3;
 
 // Whether a class that does not define __getstate__ still has one, from
 // object (3.11 on): the pickling hooks are installed unless the class has

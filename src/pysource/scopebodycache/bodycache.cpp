@@ -23,6 +23,7 @@ Py_ssize_t gBodyCacheStateOffset = 0;
 namespace {
 
 PyTypeObject BodyCacheType = {PyVarObject_HEAD_INIT(nullptr, 0)};
+PyTypeObject* gBodyCacheType = &BodyCacheType;  // the class in use (see Slots::ready)
 
 // --- Small helpers with the semantics of the Python operations ------------
 
@@ -381,7 +382,7 @@ const FunctionSpec kMethods[] = {
 
 }  // namespace
 
-PyTypeObject* scopeBodyCacheType() noexcept { return &BodyCacheType; }
+PyTypeObject* scopeBodyCacheType() noexcept { return gBodyCacheType; }
 
 void dropBodyIndexes(PyObject* self) noexcept { bodyCacheState(self).clearInternal(); }
 
@@ -390,9 +391,9 @@ void readyScopeBodyCacheType() {
     Slots::fillType(BodyCacheType);
     BodyCacheType.tp_init = cache_init;
     BodyCacheType.tp_getset = cache_getset;
-    py::checkStatus(PyType_Ready(&BodyCacheType));
+    gBodyCacheType = Slots::ready(BodyCacheType);
 }
 
-void bindScopeBodyCacheMethods() { bindMethods(&BodyCacheType, kMethods, kModuleName); }
+void bindScopeBodyCacheMethods() { bindMethods(gBodyCacheType, kMethods, kModuleName); }
 
 }  // namespace sbc

@@ -89,11 +89,11 @@ void moduleBody(PyObject* dict) {
     bindUtilities(dict);
 }
 
-// The module, made and filled; on 3.x the reference the init function
-// returns.
-py::Ref initialize() {
+// Makes and fills the module. On 3.x `owner` takes the reference the init
+// function returns; it is the caller's so that on failure the namespace
+// outlives the traceback entry that names it.
+void initialize(py::Ref& owner) {
     checkVersion();
-    py::Ref owner;
     PyObject* module = compat::createModule(gModuleDef, owner);
     PyObject* dict = PyModule_GetDict(module);
     gModuleDict = dict;
@@ -123,7 +123,6 @@ py::Ref initialize() {
     bindVariables();
     bindFunctions();
     moduleBody(dict);
-    return owner;
 }
 
 // A traceback entry naming the init function, as for a Python frame.
@@ -138,7 +137,7 @@ void addInitTraceback() noexcept {
 SBC_MODULE_INIT(scopebodycache) {
     py::Ref module;
     try {
-        module = sbc::initialize();
+        sbc::initialize(module);
     } catch (...) {
         py::setErrorFromCurrentException();
         sbc::addInitTraceback();

@@ -27,9 +27,11 @@ double getNowTime() noexcept {
 char getInfoBytesKind(PyObject* ibytes) noexcept {
     return neverRaises("pysource.symbolinfo.GetInfoBytesKind", char(0), [ibytes] {
         if (ibytes == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
-        const std::string_view bytes = compat::strView(ibytes);
-        if (bytes.size() < 2 || bytes[0] != ':') return gSymbolInfo.kPlainEquivKind;
-        return bytes[1];
+        // By characters: a kind read from a 2.7 pickle (latin-1) is the same.
+        if (compat::strLength(ibytes) < 2 || compat::strCharAt(ibytes, 0) != ':') {
+            return gSymbolInfo.kPlainEquivKind;
+        }
+        return compat::strCharAt(ibytes, 1);
     });
 }
 
