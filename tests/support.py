@@ -52,14 +52,14 @@ kPy3Messages = [
     # The interpreter's own texts of a failed `a, b = seq`.
     ('need more than %d values to unpack', 'not enough values to unpack (expected 2, got %d)'),
     ('need more than %d value to unpack', 'not enough values to unpack (expected 2, got %d)'),
-    # 3.x checks keyword names before the call reaches the module.
+    # 3.x's text (later 3.x versions check keyword names before the module does).
     ('%(function)s() keywords must be strings', 'keywords must be strings'),
     # What 2.7's PyNumber_Index says, and 3.x's.
     ("'%s' object cannot be interpreted as an index", "'%s' object cannot be interpreted as an integer"),
     # An unbound method checks its instance in 2.7; 3.x has no unbound methods,
     # and the module's own method checks it.
-    ('unbound method %s() must be called with %s instance as first argument (got %s instance instead)',
-     "descriptor '%s' requires a '%s' object but received a '%s'"),
+    ('unbound method %(what)s must be called with %(cls)s instance as first argument (got %(got)s instance instead)',
+     "descriptor '%(name)s' requires a '%(module)s.%(cls)s' object but received a '%(got)s'"),
     # Attribute errors of modules and None.
     ("'module' object has no attribute '%(attr)s'", "module '%(module)s' has no attribute '%(attr)s'"),
 ]

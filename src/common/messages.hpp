@@ -29,6 +29,10 @@ inline constexpr const char* kNeedMoreValues = compat::kPython3
                                                    : "need more than %zd value%.1s to unpack";
 inline constexpr const char* kTooManyValues = "too many values to unpack (expected %zd)";
 inline constexpr const char* kNegativeToUnsigned = "can't convert negative value to unsigned long long";
+// As the interpreter words it: later 3.x versions refuse such a call
+// before it reaches the module, and every 3.x should read the same.
+inline constexpr const char* kKeywordsMustBeStrings =
+    compat::kPython3 ? "keywords must be strings" : "%.200s() keywords must be strings";
 inline constexpr const char* kNameNotDefined = "name '%.200s' is not defined";
 inline constexpr const char* kRecursive = "FindChanges cannot be called recursively";
 inline constexpr const char* kNoScopeFound = "No logical found for scope name: {}";

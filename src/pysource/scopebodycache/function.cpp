@@ -118,7 +118,7 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObj
                 Py_ssize_t pos = 0;
                 while (PyDict_Next(kwargs, &pos, &key, &value)) {
                     if (!compat::isStr(key)) {
-                        PyErr_Format(PyExc_TypeError, "%.200s() keywords must be strings", spec.name);
+                        PyErr_Format(PyExc_TypeError, msg::kKeywordsMustBeStrings, spec.name);
                         py::fail();
                     }
                     const int at = indexOfParam(spec, key);
