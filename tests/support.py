@@ -187,7 +187,7 @@ def ModuleGlobal(module, name, value=kMissing):
 # Run in a fresh interpreter: `setup` puts substitutes for the sibling modules
 # (copies with a change) in sys.modules, then the module is imported.
 kImportPrelude = r'''
-import ctypes, sys, traceback, types, warnings
+import ctypes, sys, types, warnings
 import pysource._fastaccess, pysource.symbolinfo, tallowkit.destroyable
 FA, SI, TD = [sys.modules[n] for n in
               ('pysource._fastaccess', 'pysource.symbolinfo', 'tallowkit.destroyable')]
@@ -232,13 +232,13 @@ with warnings.catch_warnings(record=True) as caught:
         import pysource.scopebodycache
     except Exception as e:
         result['error'] = (type(e).__name__, str(e))
-        result['init_in_tb'] = 'init pysource.scopebodycache' in traceback.format_exc()
-        # 3.x drops a module that failed to load; its namespace is the
-        # globals of the init function's traceback entry.
-        tb, namespace = sys.exc_info()[2], None
+        # The traceback is walked, not formatted: a setup may have broken
+        # builtins that formatting uses. 3.x drops a module that failed to
+        # load; its namespace is the globals of the init function's entry.
+        tb, namespace, result['init_in_tb'] = sys.exc_info()[2], None, False
         while tb is not None:
             if tb.tb_frame.f_code.co_name == 'init pysource.scopebodycache':
-                namespace = tb.tb_frame.f_globals
+                namespace, result['init_in_tb'] = tb.tb_frame.f_globals, True
             tb = tb.tb_next
 result['warnings'] = [str(w.message) for w in caught]
 mod = sys.modules.get('pysource.scopebodycache')

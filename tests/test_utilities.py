@@ -2,6 +2,7 @@
 
 import math
 import struct
+import sys
 import time
 import unittest
 
@@ -145,6 +146,19 @@ class SmallFunctionsTest(unittest.TestCase):
             self.assertEqual(GetInfoBytesKind(None), 0)
         self.assertIn('pysource.symbolinfo.GetInfoBytesKind', err.getvalue())
         self.assertIn('TypeError', err.getvalue())
+
+    @unittest.skipUnless(hasattr(sys, 'unraisablehook'), 'the hook is 3.8 on')
+    def testReportReachesTheUnraisableHook(self):
+        seen = []
+        saved, sys.unraisablehook = sys.unraisablehook, seen.append
+        try:
+            with CapturedStderr() as err:
+                self.assertEqual(GetInfoBytesKind(None), 0)
+        finally:
+            sys.unraisablehook = saved
+        self.assertEqual([(u.exc_type, u.object) for u in seen],
+                         [(TypeError, 'pysource.symbolinfo.GetInfoBytesKind')])
+        self.assertIn('TypeError', err.getvalue())  # the traceback, printed first
 
 
 if __name__ == '__main__':
