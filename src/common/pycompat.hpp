@@ -467,6 +467,55 @@ inline constexpr bool kInstancesOwnHeapType = kPython3;
 // __init__: 2.7 warns, 3.x raises TypeError.
 inline constexpr bool kObjectNewRefusesArguments = kPython3;
 
+// 3.x calls a callable with a C array of arguments (vectorcall), with no
+// tuple to build; 2.7 knows only tp_call. A type that offers it keeps the
+// entry point in each instance (SBC_VECTORCALL_MEMBER).
+#if PY_MAJOR_VERSION >= 3
+#define SBC_HAVE_VECTORCALL 1
+#define SBC_VECTORCALL_MEMBER(name) vectorcallfunc name;
+#if PY_VERSION_HEX >= 0x03090000
+inline constexpr unsigned long kHaveVectorcall = Py_TPFLAGS_HAVE_VECTORCALL;
+#else
+inline constexpr unsigned long kHaveVectorcall = _Py_TPFLAGS_HAVE_VECTORCALL;
+#endif
+
+inline void enableVectorcall(PyTypeObject* type, size_t offset) noexcept {
+    type->tp_vectorcall_offset = static_cast<Py_ssize_t>(offset);
+    type->tp_flags |= kHaveVectorcall;
+}
+
+// A vectorcall handed to `call` (a tp_call) as an argument tuple and a
+// keyword dict.
+inline PyObject* vectorcallThroughTuple(ternaryfunc call, PyObject* callable, PyObject* const* args,
+                                        Py_ssize_t nargs, PyObject* kwnames) noexcept {
+    PyObject* tuple = PyTuple_New(nargs);
+    if (tuple == nullptr) return nullptr;
+    for (Py_ssize_t i = 0; i < nargs; ++i) {
+        Py_INCREF(args[i]);
+        PyTuple_SET_ITEM(tuple, i, args[i]);
+    }
+    PyObject* kwargs = nullptr;
+    const Py_ssize_t nkw = kwnames != nullptr ? PyTuple_GET_SIZE(kwnames) : 0;
+    if (nkw > 0) {
+        kwargs = PyDict_New();
+        for (Py_ssize_t k = 0; kwargs != nullptr && k < nkw; ++k) {
+            if (PyDict_SetItem(kwargs, PyTuple_GET_ITEM(kwnames, k), args[nargs + k]) < 0) Py_CLEAR(kwargs);
+        }
+        if (kwargs == nullptr) {
+            Py_DECREF(tuple);
+            return nullptr;
+        }
+    }
+    PyObject* result = call(callable, tuple, kwargs);
+    Py_DECREF(tuple);
+    Py_XDECREF(kwargs);
+    return result;
+}
+#else
+#define SBC_HAVE_VECTORCALL 0
+#define SBC_VECTORCALL_MEMBER(name)
+#endif
+
 // Whether a class that does not define __getstate__ still has one, from
 // object (3.11 on): the pickling hooks are installed unless the class has
 // its own.

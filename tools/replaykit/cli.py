@@ -225,7 +225,7 @@ def _ParseArgs(argv):
     parser.add_argument('files', nargs='*', metavar='FILE',
                         help='files to edit (default: the bundled sample)')
     parser.add_argument('--stdlib', action='store_true',
-                        help='add every .py file of the 2.7 standard library')
+                        help='add every .py file of the running interpreter\'s standard library')
     parser.add_argument('--sample', type=int, metavar='N',
                         help='replay only N of the files, picked by the seed')
     parser.add_argument('--seed', default='0', help='random seed (default 0)')

@@ -18,6 +18,7 @@ struct FunctionObject {
     PyObject* doc;       // str or None
     PyTypeObject* owner; // the class of a method, else nullptr
     bool isMethod;
+    SBC_VECTORCALL_MEMBER(vectorcall)
 };
 
 PyTypeObject FunctionType = {PyVarObject_HEAD_INIT(nullptr, 0)};
@@ -60,23 +61,33 @@ int indexOfParam(const FunctionSpec& spec, PyObject* key) {
 
 }  // namespace
 
+namespace {
+
+// The common call: every parameter by position, none by keyword. False,
+// having done nothing, for any other call.
+bool parsePositional(const FunctionSpec& spec, PyObject* const* items, Py_ssize_t nargs, ParsedArgs& out) {
+    if (nargs != spec.total || spec.total == 0 || (spec.total == 1 && spec.isInit)) return false;
+    for (int i = 0; i < spec.total; ++i) {
+        PyObject* v = items[i];
+        PyTypeObject* type;
+        const char* typeName = checkTypeName(spec.params[i].check, &type);
+        if (type != nullptr && v != Py_None && Py_TYPE(v) != type) {
+            PyErr_Format(PyExc_TypeError, msg::kArgumentType, spec.params[i].name, typeName,
+                         Py_TYPE(v)->tp_name);
+            py::fail();
+        }
+        out.set(i, v);
+    }
+    return true;
+}
+
+}  // namespace
+
 void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObject* kwargs,
                ParsedArgs& out) {
     const Py_ssize_t nargs = PyTuple_GET_SIZE(args) - first;
     const bool haveKeywords = kwargs != nullptr && PyDict_Size(kwargs) > 0;
-    // The common call: every parameter by position.
-    if (!haveKeywords && nargs == spec.total && spec.total > 0 && !(spec.total == 1 && spec.isInit)) {
-        for (int i = 0; i < spec.total; ++i) {
-            PyObject* v = PyTuple_GET_ITEM(args, first + i);
-            PyTypeObject* type;
-            const char* typeName = checkTypeName(spec.params[i].check, &type);
-            if (type != nullptr && v != Py_None && Py_TYPE(v) != type) {
-                PyErr_Format(PyExc_TypeError, msg::kArgumentType, spec.params[i].name, typeName,
-                             Py_TYPE(v)->tp_name);
-                py::fail();
-            }
-            out.set(i, v);
-        }
+    if (!haveKeywords && parsePositional(spec, &PyTuple_GET_ITEM(args, first), nargs, out)) {
         return;
     }
 
@@ -156,31 +167,55 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObj
 
 namespace {
 
+// The instance a method is called on: the first argument.
+PyObject* methodSelf(FunctionObject* f, PyObject* const* items, Py_ssize_t nargs) {
+    // Reached unbound, the first argument is the instance.
+    if (nargs < 1) {
+        PyErr_Format(PyExc_TypeError, "descriptor '%.200s' needs an argument", compat::strText(f->qualname));
+        py::fail();
+    }
+    PyObject* self = items[0];
+    // Taken from the class dict, a method can be handed anything.
+    if (!PyObject_TypeCheck(self, f->owner)) {
+        PyErr_Format(PyExc_TypeError, "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
+                     compat::strText(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
+        py::fail();
+    }
+    return self;
+}
+
 PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
     auto* f = reinterpret_cast<FunctionObject*>(op);
     return py::guarded([&]() -> PyObject* {
         PyObject* self = nullptr;
-        if (f->isMethod) {
-            // Reached unbound, the first argument is the instance.
-            if (PyTuple_GET_SIZE(args) < 1) {
-                PyErr_Format(PyExc_TypeError, "descriptor '%.200s' needs an argument",
-                             compat::strText(f->qualname));
-                py::fail();
-            }
-            self = PyTuple_GET_ITEM(args, 0);
-            // Taken from the class dict, a method can be handed anything.
-            if (!PyObject_TypeCheck(self, f->owner)) {
-                PyErr_Format(PyExc_TypeError,
-                             "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
-                             compat::strText(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
-                py::fail();
-            }
-        }
+        if (f->isMethod) self = methodSelf(f, &PyTuple_GET_ITEM(args, 0), PyTuple_GET_SIZE(args));
         ParsedArgs parsed;
         parseArgs(*f->spec, args, f->isMethod ? 1 : 0, kwargs, parsed);
         return f->spec->impl(self, parsed.argv());
     });
 }
+
+#if SBC_HAVE_VECTORCALL
+// 3.x's call without an argument tuple (a bound method passes the instance
+// first). Calls with keywords take the general path.
+PyObject* function_vectorcall(PyObject* op, PyObject* const* args, size_t nargsf, PyObject* kwnames) {
+    auto* f = reinterpret_cast<FunctionObject*>(op);
+    const Py_ssize_t nargs = PyVectorcall_NARGS(nargsf);
+    if (kwnames == nullptr || PyTuple_GET_SIZE(kwnames) == 0) {
+        PyObject* result = nullptr;
+        const bool done = py::guardedAs<bool>(true, [&] {
+            PyObject* self = f->isMethod ? methodSelf(f, args, nargs) : nullptr;
+            const Py_ssize_t first = f->isMethod ? 1 : 0;
+            ParsedArgs parsed;
+            if (!parsePositional(*f->spec, args + first, nargs - first, parsed)) return false;
+            result = f->spec->impl(self, parsed.argv());
+            return true;
+        });
+        if (done) return result;
+    }
+    return compat::vectorcallThroughTuple(function_call, op, args, nargs, kwnames);
+}
+#endif
 
 PyObject* function_descr_get(PyObject* op, PyObject* obj, PyObject* type) {
     auto* f = reinterpret_cast<FunctionObject*>(op);
@@ -242,6 +277,9 @@ py::Ref makeFunction(const FunctionSpec& spec, const char* qualname, const char*
     f->qualname = py::check(compat::strFromText(qualname)).release();
     f->module = py::check(compat::internStr(module)).release();
     f->doc = spec.doc ? py::check(compat::strFromText(spec.doc)).release() : py::Ref::none().release();
+#if SBC_HAVE_VECTORCALL
+    f->vectorcall = function_vectorcall;
+#endif
     return op;
 }
 
@@ -257,6 +295,9 @@ void readyFunctionType() {
     FunctionType.tp_descr_get = function_descr_get;
     FunctionType.tp_methods = function_methods;
     FunctionType.tp_members = function_members;
+#if SBC_HAVE_VECTORCALL
+    compat::enableVectorcall(&FunctionType, offsetof(FunctionObject, vectorcall));
+#endif
     py::checkStatus(PyType_Ready(&FunctionType));
 }
 
