@@ -187,9 +187,9 @@ def _ReadSource(path):
 
 def ParseBoth(path, source=None):
     """(logical list, ast tree), or None when either reader refuses the file."""
-    if source is None:
-        source = _ReadSource(path)
     try:
+        if source is None:
+            source = _ReadSource(path)  # 3.x: SyntaxError when not decodable as declared
         lst = ReadLogicals(source, path)
         tree = ast.parse(source, path)
     except (SyntaxError, TypeError, ValueError):

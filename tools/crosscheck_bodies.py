@@ -36,9 +36,10 @@ kScopeNodes = (ast.FunctionDef, ast.ClassDef) + tuple(
     getattr(ast, name) for name in ('AsyncFunctionDef',) if hasattr(ast, name))
 
 _kScopeKinds = (1, 2)
-_kHeaderOnly = frozenset(['else', 'elif', 'except', 'finally', '@'])
-# Blocks whose statements stay in the enclosing scope.
-_kBlockFields = ('body', 'orelse', 'finalbody', 'handlers')
+# A `case` line (3.10's match) stands first in its logical, as `except` does.
+_kHeaderOnly = frozenset(['else', 'elif', 'except', 'finally', '@', 'case'])
+# Blocks whose statements stay in the enclosing scope (`cases`: 3.10's match).
+_kBlockFields = ('body', 'orelse', 'finalbody', 'handlers', 'cases')
 
 
 def _DirectStatements(body):
@@ -52,7 +53,7 @@ def _DirectStatements(body):
             if not isinstance(inner, list):
                 continue  # Exec's `body` is an expression
             for child in inner:
-                if isinstance(child, ast.ExceptHandler):
+                if isinstance(child, ast.ExceptHandler) or type(child).__name__ == 'match_case':
                     for stmt in _DirectStatements(child.body):
                         yield stmt
                 else:
