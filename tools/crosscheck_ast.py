@@ -123,7 +123,8 @@ class _ExpectedScopes(object):
             return last
         self._Claim(first, scope)
         last = first
-        for field in ('body', 'handlers', 'orelse', 'finalbody'):  # source order
+        # Source order; `cases` are 3.10's match.
+        for field in ('body', 'handlers', 'orelse', 'finalbody', 'cases'):
             children = getattr(node, field, None)
             if not isinstance(children, list):
                 continue  # `exec`'s body is an expression
@@ -131,6 +132,11 @@ class _ExpectedScopes(object):
                 if isinstance(child, ast.excepthandler):
                     # An except clause is not a statement but holds statements.
                     self._Claim(self._Index(child.lineno), scope)
+                    for grandchild in child.body:
+                        last = max(last, self._Visit(grandchild, scope))
+                elif type(child).__name__ == 'match_case':
+                    # Nor is a case clause; its line is its pattern's.
+                    self._Claim(self._Index(child.pattern.lineno), scope)
                     for grandchild in child.body:
                         last = max(last, self._Visit(grandchild, scope))
                 else:
