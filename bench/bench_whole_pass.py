@@ -33,7 +33,7 @@ import subprocess
 import sys
 
 import benchkit
-from benchkit import CChangeFinder, Clock, FormatSpread, LogicalLineType, ReadLogicals
+from benchkit import CChangeFinder, Clock, FormatSpread, LogicalLineType, ReadLogicals, ReadLogicalsFromFile
 
 from progress import Progress
 import toolpath
@@ -48,8 +48,7 @@ def ReadAll(paths):
     with Progress(len(paths)) as progress:
         for path in paths:
             try:
-                with open(path, 'rU') as f:
-                    lists.append(ReadLogicals(f.read(), path))
+                lists.append(ReadLogicalsFromFile(path))
             except (SyntaxError, IOError):
                 pass
             progress.Step()

@@ -20,7 +20,7 @@ import toolpath  # noqa: E402
 toolpath.setup()
 
 from pysource._fastaccess import LogicalLineType  # noqa: E402,F401
-from pysource.logicals import ReadLogicals  # noqa: E402
+from pysource.logicals import ReadLogicals, ReadLogicalsFromFile  # noqa: E402,F401
 from pysource.scopebodycache import CChangeFinder  # noqa: E402
 
 Clock = getattr(time, 'process_time', None) or time.clock

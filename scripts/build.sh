@@ -1,14 +1,10 @@
 #!/usr/bin/env bash
 # Configures and builds into build/ (or, with --sanitize, build-asan/).
+# With --python PATH, builds against that interpreter (2.7 or 3.8 to 3.13)
+# into build-pyX.Y/ (build-pyX.Y-asan/ with --sanitize).
 # Extra arguments go to cmake's configure step (e.g. -DPYTHON27=/path/python2.7).
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
-dir="$root/build"
-args=()
-if [ "${1:-}" = "--sanitize" ]; then
-  shift
-  dir="$root/build-asan"
-  args+=(-DSBC_SANITIZE=ON -DCMAKE_BUILD_TYPE=Debug)
-fi
-cmake -S "$root" -B "$dir" "${args[@]}" "$@" >/dev/null
-cmake --build "$dir" -j2 >/dev/null
+. "$root/scripts/pyselect.sh"
+cmake -S "$root" -B "$sbc_dir" "${sbc_cmake[@]}" "${sbc_rest[@]}" >/dev/null
+cmake --build "$sbc_dir" -j2 >/dev/null

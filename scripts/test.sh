@@ -1,9 +1,9 @@
 #!/usr/bin/env bash
-# Builds and runs every test suite; with --sanitize, under ASan and UBSan.
+# Builds and runs every test suite; with --sanitize, under ASan and UBSan;
+# with --python PATH, against that interpreter (see build.sh).
 set -euo pipefail
 root=$(cd "$(dirname "$0")/.." && pwd)
 "$root/scripts/build.sh" "$@"
-dir="$root/build"
-if [ "${1:-}" = "--sanitize" ]; then dir="$root/build-asan"; fi
-cd "$dir"
+. "$root/scripts/pyselect.sh"
+cd "$sbc_dir"
 ctest --output-on-failure

@@ -4,9 +4,15 @@ import ast
 import contextlib
 import io
 import os
+import pickle
 import subprocess
 import sys
 import textwrap
+
+try:
+    import __builtin__ as builtins  # noqa: F401
+except ImportError:
+    import builtins  # noqa: F401
 
 kRepoDir = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
 # The tools are tested here, and the editor protocol is theirs.
@@ -18,6 +24,7 @@ from pysource.scopebodycache import CChangeFinder  # noqa: E402
 from replaykit.editor import Edit  # noqa: E402,F401
 
 SANITIZED = bool(os.environ.get('SBC_SANITIZED'))
+PY3 = sys.version_info[0] >= 3
 # Run with -O: the module's assertions are skipped too.
 OPTIMIZED = bool(sys.flags.optimize)
 kMissing = object()
@@ -32,6 +39,65 @@ class A:
 def g():
     return 2
 '''
+
+
+# --- What differs on 3.x ---------------------------------------------------------
+# Every message of the module (or of the interpreter, where a test checks
+# one) that 3.x words otherwise: the 2.7 text, the 3.x text. Text() gives
+# the one this interpreter uses; the README's "Python 3" section lists them.
+kPy3Messages = [
+    # A name must be the interpreter's str: 2.7 calls it bytes.
+    ('Expected bytes, got %s', 'Expected str, got %s'),
+    ('expected bytes, %s found', 'expected str, %s found'),
+    # The interpreter's own texts of a failed `a, b = seq`.
+    ('need more than %d values to unpack', 'not enough values to unpack (expected 2, got %d)'),
+    ('need more than %d value to unpack', 'not enough values to unpack (expected 2, got %d)'),
+    # 3.x's text (later 3.x versions check keyword names before the module does).
+    ('%(function)s() keywords must be strings', 'keywords must be strings'),
+    # What 2.7's PyNumber_Index says, and 3.x's.
+    ("'%s' object cannot be interpreted as an index", "'%s' object cannot be interpreted as an integer"),
+    # An unbound method checks its instance in 2.7; 3.x has no unbound methods,
+    # and the module's own method checks it.
+    ('unbound method %(what)s must be called with %(cls)s instance as first argument (got %(got)s instance instead)',
+     "descriptor '%(name)s' requires a '%(module)s.%(cls)s' object but received a '%(got)s'"),
+    # Attribute errors of modules and None.
+    ("'module' object has no attribute '%(attr)s'", "module '%(module)s' has no attribute '%(attr)s'"),
+]
+kPy3MessageOf = dict(kPy3Messages)
+
+
+def Text(message, *values, **named):
+    """`message` (a 2.7 text of kPy3Messages, or one that does not differ) as
+    this interpreter words it, filled with `values` (or `named`)."""
+    if PY3:
+        message = kPy3MessageOf.get(message, message)
+    return message % (values or named) if values or named else message
+
+
+# A type name in messages: the type a name must not be (2.7's unicode,
+# 3.x's bytes), and what 3.x calls 2.7's long.
+kOtherText = b''.__class__ if PY3 else u''.__class__
+kOtherTextName = kOtherText.__name__
+kLongName = 'int' if PY3 else 'long'
+
+
+def OtherText(text):
+    """`text` as the other kind of text than str: unicode on 2.7, bytes on 3.x."""
+    return text.encode('utf-8') if PY3 else text.decode('utf-8')
+
+
+def Picklers():
+    """(label, dumps, loads) of every pickling route: each protocol of the
+    native pickler and of the one written in Python (2.7's cPickle and
+    pickle; 3.x's pickle and its pure-Python classes)."""
+    if PY3:
+        modules = [('pickle', pickle._dumps, pickle._loads), ('cPickle', pickle.dumps, pickle.loads)]
+    else:
+        import cPickle
+        modules = [('pickle', pickle.dumps, pickle.loads), ('cPickle', cPickle.dumps, cPickle.loads)]
+    for name, dumps, loads in modules:
+        for proto in range(pickle.HIGHEST_PROTOCOL + 1):
+            yield '%s/%d' % (name, proto), lambda o, d=dumps, p=proto: d(o, p), loads
 
 
 def Logical(tokens, lineno=1, indent=0, kind=0):
@@ -121,7 +187,7 @@ def ModuleGlobal(module, name, value=kMissing):
 # Run in a fresh interpreter: `setup` puts substitutes for the sibling modules
 # (copies with a change) in sys.modules, then the module is imported.
 kImportPrelude = r'''
-import ctypes, sys, traceback, types, warnings
+import ctypes, sys, types, warnings
 import pysource._fastaccess, pysource.symbolinfo, tallowkit.destroyable
 FA, SI, TD = [sys.modules[n] for n in
               ('pysource._fastaccess', 'pysource.symbolinfo', 'tallowkit.destroyable')]
@@ -131,10 +197,13 @@ _New.restype, _New.argtypes = ctypes.py_object, [ctypes.c_void_p] * 3
 _keep, v, result = [], {}, {}
 
 def Signature(module, name):
-    return _GetName(module._capi[name])
+    signature = _GetName(module._capi[name])  # bytes on 3.x
+    return signature if isinstance(signature, str) else signature.decode('ascii')
 
 def Capsule(signature):
     # A capsule holds bare pointers: its name and target must outlive it.
+    if not isinstance(signature, bytes):
+        signature = signature.encode('ascii')
     name, target = ctypes.create_string_buffer(signature), ctypes.c_long(0)
     _keep.extend([name, target])
     return _New(ctypes.addressof(target), ctypes.addressof(name), None)
@@ -163,9 +232,20 @@ with warnings.catch_warnings(record=True) as caught:
         import pysource.scopebodycache
     except Exception as e:
         result['error'] = (type(e).__name__, str(e))
-        result['init_in_tb'] = 'init pysource.scopebodycache' in traceback.format_exc()
+        # The traceback is walked, not formatted: a setup may have broken
+        # builtins that formatting uses. 3.x drops a module that failed to
+        # load; its namespace is the globals of the init function's entry.
+        tb, namespace, result['init_in_tb'] = sys.exc_info()[2], None, False
+        while tb is not None:
+            if tb.tb_frame.f_code.co_name == 'init pysource.scopebodycache':
+                namespace, result['init_in_tb'] = tb.tb_frame.f_globals, True
+            tb = tb.tb_next
 result['warnings'] = [str(w.message) for w in caught]
 mod = sys.modules.get('pysource.scopebodycache')
+if mod is None and result.get('error') and namespace is not None:
+    mod = types.ModuleType('pysource.scopebodycache')
+    mod.__dict__.clear()
+    mod.__dict__.update(namespace)
 result['names'] = sorted(mod.__dict__) if mod else []
 if 'FindChanges' in getattr(mod, 'CChangeFinder', object).__dict__:
     result['names'].append('CChangeFinder.FindChanges')

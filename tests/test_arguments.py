@@ -5,7 +5,7 @@ import unittest
 import pysource.scopebodycache as sbc
 from pysource.scopebodycache import CChangeFinder
 
-from support import Logical, Outcome, Read, kDefKind
+from support import Logical, OtherText, Outcome, Read, Text, kDefKind, kOtherTextName
 
 
 class MyList(list):
@@ -46,12 +46,13 @@ class ArgumentTest(unittest.TestCase):
              '_ProcessDedentedComments() takes no keyword arguments'),
             (CChangeFinder, ([],), {'logicals': []}, TypeError,
              "__init__() got an unexpected keyword argument 'logicals'"),
-            (f.FindChanges, ([], []), {1: 2}, TypeError, 'FindChanges() keywords must be strings'),
+            (f.FindChanges, ([], []), {1: 2}, TypeError, Text('%(function)s() keywords must be strings', function='FindChanges')),
             (sbc.SetLogicalLocalScopeDefined, (l,), {'name': 'x', 'logical': l}, TypeError,
              "SetLogicalLocalScopeDefined() got multiple values for keyword argument 'logical'"),
             # Typed parameters take the exact type, checked in parameter order.
             (f.FindChanges, (MyList(self.lst), ()), {}, TypeError, TypeMessage('added_list', 'list', 'MyList')),
-            (f._UpdateContainingScope, (l, 0, u''), {}, TypeError, TypeMessage('scope_name', 'str', 'unicode')),
+            (f._UpdateContainingScope, (l, 0, OtherText('')), {}, TypeError,
+             TypeMessage('scope_name', 'str', kOtherTextName)),
             # The constructor checks its list after parsing.
             (CChangeFinder, (MyList(),), {}, TypeError, 'Expected list, got MyList'),
             (f._ProcessDedentedComments, (1.5,), {}, TypeError, None),

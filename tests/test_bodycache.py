@@ -4,7 +4,7 @@ import unittest
 
 from pysource.scopebodycache import CScopeBodyCache, GetFullNameForScopeDef
 
-from support import SANITIZED, Logical, Named, Outcome, kDefKind
+from support import SANITIZED, Logical, Named, OtherText, Outcome, Text, kDefKind, kOtherTextName
 import crosscheck_bodies  # tools/ is on the path through support
 
 kNested = """\
@@ -173,9 +173,9 @@ class FailureTest(CacheTestCase):
         self.assertEqual(Outcome(self.cache.GetBodyOfScope, 'A#0.f#0.odd#0'),
                          (ValueError, 'logical must start a scope: %r' % plain))
         self.assertEqual(self.Cached()[0], ['', 'A#0', 'A#0.f#0', 'f#1'])
-        self.lst[0].fLocalScopeName = u'A#0'
+        self.lst[0].fLocalScopeName = OtherText('A#0')
         self.assertEqual(Outcome(CScopeBodyCache(self.lst).GetScopeDef, 'A#0'),
-                         (TypeError, 'Expected bytes, got unicode'))
+                         (TypeError, Text('Expected bytes, got %s', kOtherTextName)))
 
     def testDestroyedCache(self):
         c = self.cache

@@ -6,7 +6,7 @@ import pysource.symbolinfo as symbolinfo
 from pysource._fastaccess import LogicalLineType
 from pysource.scopebodycache import GetFullNameForScopeDef
 
-from support import OPTIMIZED, Logical, Outcome, kClassKind, kCommentKind, kDefKind
+from support import OPTIMIZED, Logical, Outcome, Text, kClassKind, kCommentKind, kDefKind
 
 Join = symbolinfo.JoinTwoScopeNames
 
@@ -39,7 +39,7 @@ class FullNameTest(unittest.TestCase):
             (ScopeDef(['def', 'f', ':'], kDefKind, None, 'f#0'), fails(Outcome(Join, None, 'f#0'))),
             (ScopeDef(['def'], kDefKind, 'A#0'), fails('A#0')),
             (ScopeDef(['\\', 'class'], kClassKind, None), fails(None)),
-            (ScopeDef(['def', 'f', ':'], kDefKind, '', 5), (TypeError, 'Expected bytes, got int')),
+            (ScopeDef(['def', 'f', ':'], kDefKind, '', 5), (TypeError, Text('Expected bytes, got %s', 'int'))),
             (ScopeDef(['def', 'f', ':'], kDefKind, 5), Outcome(Join, 5, 'f')),
         ]
         for scope_def, expected in cases:

@@ -18,7 +18,7 @@ def Fuzz(*args, **kw):
     """(exit status, stdout) of tools/fuzz.py in this interpreter and environment."""
     flags = ['-O'] if kw.get('optimize') else []
     proc = subprocess.Popen([sys.executable] + flags + [FUZZ] + list(args),
-                            stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+                            stdout=subprocess.PIPE, stderr=subprocess.STDOUT, universal_newlines=True)
     out = proc.communicate()[0]
     return proc.returncode, out
 
@@ -130,7 +130,7 @@ class FuzzSmokeTest(unittest.TestCase):
         with open(path, 'w') as f:
             f.write(script)
         proc = subprocess.Popen([sys.executable, path], stdout=subprocess.PIPE,
-                                stderr=subprocess.STDOUT)
+                                stderr=subprocess.STDOUT, universal_newlines=True)
         out = proc.communicate()[0]
         self.assertEqual(proc.returncode, 1, out)
         self.assertIn("got ('planted', None)", out)

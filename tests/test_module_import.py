@@ -1,6 +1,5 @@
 """The module's import: its namespace, its classes, and each way loading fails."""
 
-import __builtin__
 import difflib
 import gc
 import sys
@@ -13,7 +12,7 @@ from tallowkit.destroyable import CDestroyable
 import pysource.scopebodycache as sbc
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache
 
-from support import ImportWith, Outcome, Read
+from support import ImportWith, Outcome, Read, Text, builtins
 
 kModule = 'pysource.scopebodycache'
 kFastaccess = ['LogicalCheck', 'RaiseIfNotLogical', 'IsWhitespaceLogical', 'IsScopeStartLogical',
@@ -115,7 +114,7 @@ class NamespaceTest(unittest.TestCase):
         self.assertIs(sbc._fastaccess, sys.modules['pysource._fastaccess'])
         self.assertIs(sbc.symbolinfo, pysource.symbolinfo)
         self.assertIs(sbc.tallowkit, tallowkit)
-        self.assertIs(sbc.__builtins__, __builtin__)
+        self.assertIs(sbc.__builtins__, builtins)
 
     def testDocstrings(self):
         objects = dict((name, getattr(sbc, name)) for name in kFunctions)
@@ -191,16 +190,16 @@ kFailures = [
     ("v['e'], v['g'] = Signature(SI, 'JoinTwoScopeNames'), Signature(SI, 'SplitScopeNames')\n"
      "Substitute(SI, capi={'JoinTwoScopeNames': Capsule(v['g'])})", 'TypeError',
      'C function pysource.symbolinfo.JoinTwoScopeNames has wrong signature (expected %(e)s, got %(g)s)'),
-    ("Substitute(SI, drop=['_capi'])", 'AttributeError', "'module' object has no attribute '_capi'"),
+    ("Substitute(SI, drop=['_capi'])", 'AttributeError', Text("'module' object has no attribute '%(attr)s'", module='pysource.symbolinfo', attr='_capi')),
     ("Substitute(TD, CDestroyable=lambda: None)", 'TypeError',
      'tallowkit.destroyable.CDestroyable is not a type object', [], ['CScopeBodyCache', 'CChangeFinder']),
-    ("Substitute(TD, drop=['CDestroyable'])", 'AttributeError', "'module' object has no attribute 'CDestroyable'"),
+    ("Substitute(TD, drop=['CDestroyable'])", 'AttributeError', Text("'module' object has no attribute '%(attr)s'", module='tallowkit.destroyable', attr='CDestroyable')),
     (kSmaller % 'TD.CDestroyable' + "Substitute(TD, CDestroyable=Slotted(v['got']))",
      'ValueError', kSizeMessage % 'tallowkit.destroyable.CDestroyable', [], ['CChangeFinder']),
     # The right size but no native method table.
     ("Substitute(TD, CDestroyable=Slotted(TD.CDestroyable.__basicsize__))", 'RuntimeError',
      'invalid vtable found for imported type'),
-    ("import __builtin__; del __builtin__.enumerate", 'NameError', "name 'enumerate' is not defined", [],
+    ("import %s as b; del b.enumerate" % builtins.__name__, 'NameError', "name 'enumerate' is not defined", [],
      ['CScopeBodyCache']),
     # In sys.modules but no longer an attribute of the package.
     ("import pysource; del pysource.symbolinfo", 'ImportError', 'cannot import name symbolinfo',

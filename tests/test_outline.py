@@ -13,12 +13,13 @@ import unittest
 
 from support import kRepoDir, TextBuffer
 import outline  # tools/ is on the path through support
+import toolpath
 import progress
 
 kTool = os.path.join(kRepoDir, 'tools', 'outline.py')
 # The sanitized build is not in build/, where the tool looks by itself.
 kFindsBuildItself = not os.environ.get('SBC_SANITIZED') and os.path.exists(
-    os.path.join(kRepoDir, 'build', 'python', 'pysource', 'scopebodycache.so'))
+    os.path.join(toolpath.BuildDir(), 'python', 'pysource', 'scopebodycache.so'))
 
 
 def Main(*args):

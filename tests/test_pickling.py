@@ -1,7 +1,9 @@
 """Pickling and copying CChangeFinder and CScopeBodyCache."""
 
+import binascii
 import copy
-import cPickle
+import json
+import os
 import pickle
 import unittest
 
@@ -9,7 +11,7 @@ from pysource import scopebodycache
 from pysource._fastaccess import LogicalLineType
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache
 
-from support import Named, Names, Outcome, Read, WholeListNames
+from support import PY3, Named, Names, Outcome, Picklers, Read, WholeListNames, kRepoDir
 
 # Module-level names: inside a class body `__pyx_...` would be mangled.
 UnpickleFinder = scopebodycache.__dict__['__pyx_unpickle_CChangeFinder']
@@ -33,13 +35,6 @@ def g():
 SubFinder = type('SubFinder', (CChangeFinder,), {})
 SubCache = type('SubCache', (CScopeBodyCache,), {})
 SubDict = type('SubDict', (dict,), {})
-
-
-def Picklers():
-    """(label, dumps, loads) of every pickling route."""
-    for module in (pickle, cPickle):
-        for proto in (0, 1, 2):
-            yield '%s/%d' % (module.__name__, proto), lambda o, m=module, p=proto: m.dumps(o, p), module.loads
 
 
 def Plain(value):
@@ -136,7 +131,7 @@ class ReduceFormTest(unittest.TestCase):
         self.assertEqual(cf.__reduce__()[2], state)
 
     def testRebuildFunctionsByNameLookedUpAtEachReduce(self):
-        self.assertIn('scopebodycache\n__pyx_unpickle_CChangeFinder', pickle.dumps(CChangeFinder(None), 0))
+        self.assertIn(b'scopebodycache\n__pyx_unpickle_CChangeFinder', pickle.dumps(CChangeFinder(None), 0))
         marker = lambda *args: None  # noqa: E731
         setattr(scopebodycache, '__pyx_unpickle_CScopeBodyCache', marker)
         try:
@@ -195,6 +190,66 @@ class RefusedTest(unittest.TestCase):
         sub = SubCache(None)
         sub.__setstate__((False, None, None, None, None, {'x': 1}, 'ignored'))
         self.assertEqual(sub.x, 1)
+
+
+class FromPython27Test(unittest.TestCase):
+    """Pickles made by 2.7 with protocol 2 (tests/fixtures/make_pickles27.py)
+    load on 3.x with the same state, 2.7's str decoded."""
+
+    def setUp(self):
+        with open(os.path.join(kRepoDir, 'tests', 'fixtures', 'pickles27.json')) as f:
+            fixture = json.load(f)
+        self.source = binascii.unhexlify(fixture['source'])
+        self.pickles = dict((k, binascii.unhexlify(v)) for k, v in fixture.items() if k != 'source')
+
+    def Load(self, key, encoding):
+        if not PY3:
+            return pickle.loads(self.pickles[key])
+        return pickle.loads(self.pickles[key], encoding=encoding)
+
+    def Fresh(self):
+        """What this interpreter makes of the same source: a finder after a
+        whole pass and a cache asked the same questions."""
+        lst = Read(self.source.decode('utf-8') if PY3 else self.source)
+        finder = CChangeFinder(lst)
+        finder.FindChanges(lst, [])
+        cache = CScopeBodyCache(lst)
+        cache.GetBodyOfScope('A#0.f#1')
+        cache.GetScopeDef('g#0.A#0')
+        return finder, cache
+
+    def testSameStateAsAFreshPass(self):
+        finder, cache = self.Fresh()
+        # utf-8 gives 2.7's tokens as this interpreter reads the source.
+        for key, fresh in [('finder', finder), ('cache', cache)]:
+            loaded = self.Load(key, 'utf-8')
+            self.assertIs(type(loaded), type(fresh))
+            self.assertEqual(Fields(loaded), Fields(fresh), key)
+        loaded_finder, loaded_cache = self.Load('pair', 'utf-8')
+        self.assertIs(loaded_finder._fLogicalList, loaded_cache._fLogicalList)
+
+    def testNamesDecodedWithLatin1(self):
+        # latin1 takes every byte for a character: the names (ASCII) are the
+        # same; the one token outside ASCII is its UTF-8 bytes as characters.
+        finder, _ = self.Fresh()
+        loaded = self.Load('finder', 'latin1')
+        self.assertEqual(Names(loaded._fLogicalList), Names(finder._fLogicalList))
+        for name in [n for pair in Names(loaded._fLogicalList) for n in pair if n is not None]:
+            self.assertIs(type(name), str)
+        tokens = [t for l in loaded._fLogicalList for t in l.fTokens]
+        self.assertIn("'\xc3\xa9t\xc3\xa9'", tokens)
+
+    def testLoadedObjectsWork(self):
+        finder, cache = self.Fresh()
+        loaded_finder, loaded_cache = self.Load('pair', 'latin1')
+        lst = loaded_finder._fLogicalList
+        # An edit through the loaded finder: the last line removed.
+        removed = [lst.pop()]
+        self.assertEqual(loaded_finder.FindChanges([], removed), ({'g#0.A#0'}, set(), set()))
+        loaded_cache.Clear(['g#0.A#0', 'g#0'])
+        self.assertEqual([l.fLineno for l in loaded_cache.GetBodyOfScope('A#0.f#1')],
+                         [l.fLineno for l in cache.GetBodyOfScope('A#0.f#1')])
+        self.assertEqual(Names(lst), Names(finder._fLogicalList)[:-1])
 
 
 if __name__ == '__main__':

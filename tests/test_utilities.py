@@ -2,6 +2,7 @@
 
 import math
 import struct
+import sys
 import time
 import unittest
 
@@ -12,7 +13,8 @@ from pysource.scopebodycache import (
     GetNowTime, IsDefKind, IsScopeStartLogical, IsWhitespaceLogical, LogicalCheck, OutOfTime,
     PySet_InplaceOr, RaiseIfNotLogical, SetLogicalLocalScopeDefined, ULongLongValueForDoubleBits)
 
-from support import CapturedStderr, Logical, Outcome, kBlankKind, kClassKind, kCommentKind, kDefKind
+from support import (CapturedStderr, Logical, OtherText, Outcome, Text, kBlankKind, kClassKind, kCommentKind,
+                     kDefKind, kOtherTextName)
 
 
 SubLogical = type('SubLogical', (LogicalLineType,), {})
@@ -71,9 +73,9 @@ class LogicalTest(unittest.TestCase):
         # None clears it; the tokens count again. A name of another type is refused when read.
         SetLogicalLocalScopeDefined(l, None)
         self.assertEqual((l.fLocalScopeName, GetLocalScopeDefined(Logical(['def', 'f'], kind=kDefKind))), (None, 'f'))
-        for value, type_name in [(5, 'int'), (u'f', 'unicode')]:
+        for value, type_name in [(5, 'int'), (OtherText('f'), kOtherTextName)]:
             SetLogicalLocalScopeDefined(l, value)
-            self.assertEqual(Outcome(GetLocalScopeDefined, l), (TypeError, 'Expected bytes, got %s' % type_name))
+            self.assertEqual(Outcome(GetLocalScopeDefined, l), (TypeError, Text('Expected bytes, got %s', type_name)))
 
 
 class SmallFunctionsTest(unittest.TestCase):
@@ -138,12 +140,25 @@ class SmallFunctionsTest(unittest.TestCase):
         wrong = "Argument 'ibytes' has incorrect type (expected str, got %s)"
         for ibytes, expected in [
                 ('x', plain), (':', plain), ('x:y', plain), (':Fname', ord('F')), (':\xff', -1),
-                (':\0', 0), (u':x', (TypeError, wrong % 'unicode'))]:
+                (':\0', 0), (OtherText(':x'), (TypeError, wrong % kOtherTextName))]:
             self.assertEqual(Outcome(GetInfoBytesKind, ibytes), expected, repr(ibytes))
         with CapturedStderr() as err:
             self.assertEqual(GetInfoBytesKind(None), 0)
         self.assertIn('pysource.symbolinfo.GetInfoBytesKind', err.getvalue())
         self.assertIn('TypeError', err.getvalue())
+
+    @unittest.skipUnless(hasattr(sys, 'unraisablehook'), 'the hook is 3.8 on')
+    def testReportReachesTheUnraisableHook(self):
+        seen = []
+        saved, sys.unraisablehook = sys.unraisablehook, seen.append
+        try:
+            with CapturedStderr() as err:
+                self.assertEqual(GetInfoBytesKind(None), 0)
+        finally:
+            sys.unraisablehook = saved
+        self.assertEqual([(u.exc_type, u.object) for u in seen],
+                         [(TypeError, 'pysource.symbolinfo.GetInfoBytesKind')])
+        self.assertIn('TypeError', err.getvalue())  # the traceback, printed first
 
 
 if __name__ == '__main__':

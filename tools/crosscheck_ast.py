@@ -35,7 +35,9 @@ from pysource.scopebodycache import CChangeFinder, GetFullNameForScopeDef  # noq
 
 kWhitespaceKinds = (21, 22)
 kScopeStartKinds = (1, 2)
-_kScopeNodes = (ast.FunctionDef, ast.ClassDef)
+# `async def` (3.x) opens a function scope as `def` does.
+_kScopeNodes = (ast.FunctionDef, ast.ClassDef) + tuple(
+    getattr(ast, name) for name in ('AsyncFunctionDef',) if hasattr(ast, name))
 
 
 class Disagreement(object):
@@ -79,7 +81,7 @@ class _ExpectedScopes(object):
         # _Visit records covers after the nested ones; apply the outer ones
         # first so that the innermost covering statement decides.
         for first, last, scope in reversed(self._covers):
-            for i in xrange(first + 1, last + 1):
+            for i in range(first + 1, last + 1):
                 self.covered[i] = scope
 
     def _Index(self, lineno):
@@ -102,7 +104,9 @@ class _ExpectedScopes(object):
                     if self._lst[header].fKind not in kWhitespaceKinds:
                         self._Claim(header, scope)
                     header += 1
-            if header >= len(self._lst) or self._TokenAt(header, 1) != node.name:
+            # The name follows `def`/`class`, and `async def` (3.x).
+            at = 2 if header < len(self._lst) and self._TokenAt(header, 0) == 'async' else 1
+            if header >= len(self._lst) or self._TokenAt(header, at) != node.name:
                 self.problems.append((node.lineno, 'no %s line for %r after the decorators'
                                       % (type(node).__name__, node.name)))
                 return first
@@ -119,7 +123,8 @@ class _ExpectedScopes(object):
             return last
         self._Claim(first, scope)
         last = first
-        for field in ('body', 'handlers', 'orelse', 'finalbody'):  # source order
+        # Source order; `cases` are 3.10's match.
+        for field in ('body', 'handlers', 'orelse', 'finalbody', 'cases'):
             children = getattr(node, field, None)
             if not isinstance(children, list):
                 continue  # `exec`'s body is an expression
@@ -127,6 +132,11 @@ class _ExpectedScopes(object):
                 if isinstance(child, ast.excepthandler):
                     # An except clause is not a statement but holds statements.
                     self._Claim(self._Index(child.lineno), scope)
+                    for grandchild in child.body:
+                        last = max(last, self._Visit(grandchild, scope))
+                elif type(child).__name__ == 'match_case':
+                    # Nor is a case clause; its line is its pattern's.
+                    self._Claim(self._Index(child.pattern.lineno), scope)
                     for grandchild in child.body:
                         last = max(last, self._Visit(grandchild, scope))
                 else:
@@ -178,15 +188,14 @@ class _ExpectedScopes(object):
 
 
 def _ReadSource(path):
-    with open(path, 'rU') as f:
-        return f.read()
+    return toolpath.ReadSource(path)
 
 
 def ParseBoth(path, source=None):
     """(logical list, ast tree), or None when either reader refuses the file."""
-    if source is None:
-        source = _ReadSource(path)
     try:
+        if source is None:
+            source = _ReadSource(path)  # 3.x: SyntaxError when not decodable as declared
         lst = ReadLogicals(source, path)
         tree = ast.parse(source, path)
     except (SyntaxError, TypeError, ValueError):

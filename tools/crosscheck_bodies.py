@@ -31,24 +31,29 @@ toolpath.setup()
 from pysource.logicals import ReadLogicals  # noqa: E402
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache, GetFullNameForScopeDef  # noqa: E402
 
+# `async def` (3.x) opens a function scope as `def` does.
+kScopeNodes = (ast.FunctionDef, ast.ClassDef) + tuple(
+    getattr(ast, name) for name in ('AsyncFunctionDef',) if hasattr(ast, name))
+
 _kScopeKinds = (1, 2)
-_kHeaderOnly = frozenset(['else', 'elif', 'except', 'finally', '@'])
-# Blocks whose statements stay in the enclosing scope.
-_kBlockFields = ('body', 'orelse', 'finalbody', 'handlers')
+# A `case` line (3.10's match) stands first in its logical, as `except` does.
+_kHeaderOnly = frozenset(['else', 'elif', 'except', 'finally', '@', 'case'])
+# Blocks whose statements stay in the enclosing scope (`cases`: 3.10's match).
+_kBlockFields = ('body', 'orelse', 'finalbody', 'handlers', 'cases')
 
 
 def _DirectStatements(body):
     """Statements directly in a scope: through compound blocks, not into defs."""
     for node in body:
         yield node
-        if isinstance(node, (ast.FunctionDef, ast.ClassDef)):
+        if isinstance(node, kScopeNodes):
             continue
         for field in _kBlockFields:
             inner = getattr(node, field, None)
             if not isinstance(inner, list):
                 continue  # Exec's `body` is an expression
             for child in inner:
-                if isinstance(child, ast.ExceptHandler):
+                if isinstance(child, ast.ExceptHandler) or type(child).__name__ == 'match_case':
                     for stmt in _DirectStatements(child.body):
                         yield stmt
                 else:
@@ -72,7 +77,7 @@ class _File(object):
 
     def IndexOfStatement(self, node):
         i = self.IndexOfLine(node.lineno)
-        if isinstance(node, (ast.FunctionDef, ast.ClassDef)) and node.decorator_list:
+        if isinstance(node, kScopeNodes) and node.decorator_list:
             # The node's line is its first decorator's; the def line follows.
             while self.logicals[i].fKind not in _kScopeKinds:
                 i += 1
@@ -88,7 +93,7 @@ class _File(object):
             else:
                 yield GetFullNameForScopeDef(self.logicals[header]), header, body
             for node in _DirectStatements(body):
-                if isinstance(node, (ast.FunctionDef, ast.ClassDef)):
+                if isinstance(node, kScopeNodes):
                     pending.append((self.IndexOfStatement(node), node.body))
 
     def Disagreements(self, name, header, body):
@@ -172,10 +177,10 @@ def main(argv=None):
     totals = CheckFiles(PythonFiles(root))
     if verbose:
         for line in totals['details']:
-            print line
-    print 'files: %d (skipped %d)' % (totals['files'], totals['skipped'])
-    print 'scopes: %d' % totals['scopes']
-    print 'disagreements: %d' % totals['disagreements']
+            print(line)
+    print('files: %d (skipped %d)' % (totals['files'], totals['skipped']))
+    print('scopes: %d' % totals['scopes'])
+    print('disagreements: %d' % totals['disagreements'])
     return 1 if totals['disagreements'] else 0
 
 

@@ -105,22 +105,34 @@ def _Sanitize(argv):
     """Starts this script again with the sanitizer runtime preloaded and the
     sanitizer build first on the path."""
     repo = os.path.dirname(os.path.dirname(os.path.abspath(__file__)))
-    libs = [subprocess.check_output(['g++', '-print-file-name=' + lib]).strip()
+    libs = [subprocess.check_output(['g++', '-print-file-name=' + lib]).decode('ascii').strip()
             for lib in ('libasan.so', 'libubsan.so')]
     env = dict(os.environ)
     env['LD_PRELOAD'] = ':'.join(libs)
     env['ASAN_OPTIONS'] = 'detect_leaks=0:abort_on_error=1'
     env['UBSAN_OPTIONS'] = 'print_stacktrace=1:halt_on_error=1'
-    env['PYTHONPATH'] = os.path.join(repo, 'build-asan', 'python') + os.pathsep + \
+    build = 'build-asan' if sys.version_info[:2] == (2, 7) else 'build-py%d.%d-asan' % sys.version_info[:2]
+    env['PYTHONPATH'] = os.path.join(repo, build, 'python') + os.pathsep + \
         env.get('PYTHONPATH', '')
     flags = ['-O'] if sys.flags.optimize else []
     argv = [a for a in argv if a != '--sanitize']
     os.execve(sys.executable, [sys.executable] + flags + [os.path.abspath(__file__)] + argv, env)
 
 
+def _FixHashSeed(argv):
+    """3.x salts str hashes per process: an episode replays the same calls
+    only under one seed, so the fuzzer starts again with a fixed one (2.7
+    does not salt them)."""
+    env = dict(os.environ, PYTHONHASHSEED='0')
+    flags = ['-O'] if sys.flags.optimize else []
+    os.execve(sys.executable, [sys.executable] + flags + [os.path.abspath(__file__)] + argv, env)
+
+
 def main(argv=None):
     argv = sys.argv[1:] if argv is None else argv
     args = _ParseArgs(argv)
+    if sys.version_info[0] >= 3 and os.environ.get('PYTHONHASHSEED') != '0':
+        _FixHashSeed(argv)
     if args.sanitize and 'libasan' not in os.environ.get('LD_PRELOAD', ''):
         _Sanitize(argv)
     import toolpath

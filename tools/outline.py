@@ -91,10 +91,11 @@ def FullName(logical):
 def ReadScopes(path):
     """The logical list of the file at `path`, after a whole-file pass."""
     try:
-        with open(path, 'rU') as f:
-            source = f.read()
+        source = toolpath.ReadSource(path)
     except IOError as exc:
         raise UsageError('%s: %s' % (path, exc.strerror or exc))
+    except (SyntaxError, ValueError) as exc:  # 3.x: not decodable as declared
+        raise UsageError('%s: %s' % (path, exc))
     try:
         lst = ReadLogicals(source, path)
     except SyntaxError as exc:

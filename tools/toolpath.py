@@ -8,8 +8,17 @@ kToolsDir = os.path.dirname(os.path.abspath(__file__))
 kRepoDir = os.path.dirname(kToolsDir)
 
 
+def BuildDir():
+    """Where scripts/build.sh builds for the running interpreter: build/ for
+    2.7, build-pyX.Y/ for another."""
+    if sys.version_info[:2] == (2, 7):
+        return os.path.join(kRepoDir, 'build')
+    return os.path.join(kRepoDir, 'build-py%d.%d' % sys.version_info[:2])
+
+
 def setup():
-    """Imports pysource.scopebodycache, falling back to <repo>/build/python.
+    """Imports pysource.scopebodycache, falling back to the build directory's
+    python/ (BuildDir).
 
     Returns the repository root.
     """
@@ -21,9 +30,28 @@ def setup():
         for name in list(sys.modules):
             if name.split('.')[0] in ('pysource', 'tallowkit'):
                 del sys.modules[name]
-        sys.path.insert(0, os.path.join(kRepoDir, 'build', 'python'))
+        sys.path.insert(0, os.path.join(BuildDir(), 'python'))
         import pysource.scopebodycache  # noqa: F401
     return kRepoDir
+
+
+def ReadSource(path):
+    """The text of the source file at `path` with newlines made '\\n', as
+    2.7's universal-newline read gives it: bytes on 2.7; on 3.x str,
+    decoded as the file declares (SyntaxError or UnicodeDecodeError when it
+    cannot be)."""
+    if sys.version_info[0] == 2:
+        with open(path, 'rU') as f:
+            return f.read()
+    import io
+    import tokenize
+    with open(path, 'rb') as f:
+        data = f.read()
+    encoding, _ = tokenize.detect_encoding(io.BytesIO(data).readline)
+    text = data.decode(encoding)
+    if text.startswith(u'\ufeff'):
+        text = text[1:]
+    return text.replace(u'\r\n', u'\n').replace(u'\r', u'\n')
 
 
 def StdlibDir():

@@ -3,6 +3,7 @@
 // interpreter's own messages, callers rely on it being that message.
 #pragma once
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 
 #include <string>
@@ -11,7 +12,8 @@ namespace msg {
 
 inline constexpr const char* kNotLogical = "Argument must be a logical";
 inline constexpr const char* kExpectedType = "Expected %.16s, got %.200s";
-inline constexpr const char* kExpectedBytes = "expected bytes, %.200s found";
+inline constexpr const char* kExpectedBytes =
+    compat::kPython3 ? "expected str, %.200s found" : "expected bytes, %.200s found";
 inline constexpr const char* kArgumentType =
     "Argument '%.200s' has incorrect type (expected %.200s, got %.200s)";
 inline constexpr const char* kNoneHasNoLen = "object of type 'NoneType' has no len()";
@@ -21,9 +23,16 @@ inline constexpr const char* kNoneNoAttribute = "'NoneType' object has no attrib
 inline constexpr const char* kNoneNotSubscriptable = "'NoneType' object is not subscriptable";
 inline constexpr const char* kListIndexOutOfRange = "list index out of range";
 inline constexpr const char* kTupleIndexOutOfRange = "tuple index out of range";
-inline constexpr const char* kNeedMoreValues = "need more than %zd value%.1s to unpack";
+// The interpreter's own texts of a failed `a, b = seq`.
+inline constexpr const char* kNeedMoreValues = compat::kPython3
+                                                   ? "not enough values to unpack (expected 2, got %zd)"
+                                                   : "need more than %zd value%.1s to unpack";
 inline constexpr const char* kTooManyValues = "too many values to unpack (expected %zd)";
 inline constexpr const char* kNegativeToUnsigned = "can't convert negative value to unsigned long long";
+// As the interpreter words it: later 3.x versions refuse such a call
+// before it reaches the module, and every 3.x should read the same.
+inline constexpr const char* kKeywordsMustBeStrings =
+    compat::kPython3 ? "keywords must be strings" : "%.200s() keywords must be strings";
 inline constexpr const char* kNameNotDefined = "name '%.200s' is not defined";
 inline constexpr const char* kRecursive = "FindChanges cannot be called recursively";
 inline constexpr const char* kNoScopeFound = "No logical found for scope name: {}";
@@ -66,10 +75,11 @@ inline constexpr const char* kCommentRunStuck =
 // The template's `{}` replaced with repr(value).
 [[noreturn]] inline void raiseWithRepr(PyObject* type, const char* templ, PyObject* value) {
     py::Ref r = py::check(PyObject_Repr(value));
+    const std::string_view shown = compat::strView(r.get());
     std::string text(templ);
     const auto at = text.find("{}");
-    text.replace(at, 2, PyString_AS_STRING(r.get()), PyString_GET_SIZE(r.get()));
-    py::Ref message = py::check(PyString_FromStringAndSize(text.data(), text.size()));
+    text.replace(at, 2, shown.data(), shown.size());
+    py::Ref message = py::check(compat::strFromBytes(text.data(), static_cast<Py_ssize_t>(text.size())));
     PyErr_SetObject(type, message.get());
     py::fail();
 }

@@ -8,10 +8,6 @@
 #include <new>
 #include <utility>
 
-// Init functions must stay visible although the modules build with hidden
-// visibility (the 2.7 headers' PyMODINIT_FUNC does not say so).
-#define PY_MODULE_INIT extern "C" __attribute__((visibility("default"))) void
-
 namespace py {
 
 // Thrown when a C API call failed and a Python exception is already set.
@@ -96,18 +92,6 @@ inline Py_ssize_t checkSize(Py_ssize_t n) {
 }
 
 inline bool truth(PyObject* o) { return checkStatus(PyObject_IsTrue(o)) != 0; }
-
-// A machine-size index; non-integers raise the interpreter's TypeError
-// instead of being truncated.
-inline Py_ssize_t asIndex(PyObject* o) {
-    if (PyInt_CheckExact(o)) return PyInt_AS_LONG(o);
-    PyObject* index = PyNumber_Index(o);
-    if (index == nullptr) fail();
-    Py_ssize_t v = PyInt_AsSsize_t(index);
-    Py_DECREF(index);
-    if (v == -1 && PyErr_Occurred()) fail();
-    return v;
-}
 
 // Stores `value` into an owned PyObject* slot. The old value is released
 // last: its destructor may run Python code that looks at the slot.

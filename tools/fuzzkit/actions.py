@@ -2,11 +2,20 @@
 calls through ctx.Call and checks what its oracles can check."""
 
 import copy
-import cPickle
 import gc
 import pickle
 import sys
 import time
+
+try:
+    import cPickle
+except ImportError:  # 3.x: the native pickler is pickle's; the Python one is its _dumps/_loads
+    cPickle, pickle = pickle, type('PurePickle', (), {'dumps': staticmethod(pickle._dumps),
+                                                      'loads': staticmethod(pickle._loads)})
+try:
+    long
+except NameError:  # 3.x
+    long = int
 
 import pysource.scopebodycache as sbc
 import pysource._fastaccess as fastaccess
@@ -179,7 +188,7 @@ def WholePassAgain(ctx):
 
 def Lookups(ctx):
     fresh = CScopeBodyCache(ctx.doc.lst)
-    names = ScopeNames(ctx.doc.lst) + ['nope', 'A#0.zz', 'f#99', '.', 'A#0.', u'f#0']
+    names = ScopeNames(ctx.doc.lst) + ['nope', 'A#0.zz', 'f#99', '.', 'A#0.', hostile.Other(u'f#0')]
     for _ in range(ctx.rng.randint(1, 6)):
         name = ctx.rng.choice(names)
         method = ctx.rng.choice(['GetScopeDef', 'GetBodyOfScope', '_FindScopeDef'])
@@ -487,7 +496,7 @@ def Plausible(ctx, param, junk_only=False):
     if param == '__pyx_type':
         return rng.choice([CChangeFinder, CScopeBodyCache, PlainFinderSub, int, None])
     if param == '__pyx_checksum':
-        return rng.choice(kChecksums.values() + [0, -1, 2 ** 64])
+        return rng.choice(list(kChecksums.values()) + [0, -1, 2 ** 64])
     if param == '__pyx_state':
         return CraftState(ctx, rng.choice([CChangeFinder, CScopeBodyCache]))
     if param == 'set_obj':
@@ -499,7 +508,7 @@ def Plausible(ctx, param, junk_only=False):
     if param in ('l', 'kind'):
         return rng.choice([0, -1, 127, 128, -129, 2 ** 64 - 1, 2 ** 64, -2 ** 63, 1.0])
     if param == 'ibytes':
-        return rng.choice(['', ':', ':x', 'ab', None, u':x', hostile.StrSub(':y'), bytearray(':z')])
+        return rng.choice(['', ':', ':x', 'ab', None, hostile.Other(u':x'), hostile.StrSub(':y'), bytearray(b':z')])
     return hostile.Value(rng, lst, junk_only)
 
 
@@ -1120,7 +1129,7 @@ def ThreadEdit(ctx):
                 except Exception:
                     pass
             time.sleep(0)
-    sys.setcheckinterval(rng.choice([1, 5, 50]))
+    hostile.SetSwitchInterval(rng.choice([1, 5, 50]))
     ctx.threads.Start(Worker)
     edit = MakeEdit(ctx)
     ctx.plan.armed = True
@@ -1131,7 +1140,7 @@ def ThreadEdit(ctx):
         ctx.plan.armed = False
         stop.append(1)
     ctx.CheckUsable('FindChanges with a second thread in the finder')
-    sys.setcheckinterval(100)
+    hostile.SetSwitchInterval(100)
     ctx.dirty = True
     ctx.Resync()
 

@@ -65,7 +65,8 @@ class Recorder(object):
     def _Write(self, line):
         self.lines.append(line)
         if self.fd is not None:
-            os.write(self.fd, line + '\n')
+            text = line + '\n'
+            os.write(self.fd, text if isinstance(text, bytes) else text.encode('utf-8', 'backslashreplace'))
 
     def Note(self, text):
         self._Write('  # ' + text)

@@ -79,6 +79,11 @@ def NameScript(before, removed, added_at, text_after, call):
 from pysource._fastaccess import LogicalLineType as L
 from pysource.scopebodycache import CChangeFinder
 
+try:
+    long
+except NameError:  # 3.x
+    long = int
+
 
 def Mk(tokens, lineno, indent, kind, scope, local):
     l = L(list(tokens), lineno, indent, kind)
@@ -88,14 +93,14 @@ def Mk(tokens, lineno, indent, kind, scope, local):
 lst = %s
 removed = %s
 added = [lst[k] for k in %r]
-print CChangeFinder(lst).%s
+print(CChangeFinder(lst).%s)
 fresh = [L(list(l.fTokens), l.fLineno, l.fIndent, l.fKind) for l in lst]
 CChangeFinder(fresh).FindChanges(fresh, [])
 bad = [(k, (a.fScopeName, a.fLocalScopeName), (b.fScopeName, b.fLocalScopeName))
        for k, (a, b) in enumerate(zip(lst, fresh))
        if (a.fScopeName, a.fLocalScopeName) != (b.fScopeName, b.fLocalScopeName)]
 for k, got, want in bad:
-    print 'lst[%%d]: got %%r, whole pass gives %%r' %% (k, got, want)
+    print('lst[%%d]: got %%r, whole pass gives %%r' %% (k, got, want))
 raise SystemExit(1 if bad else 0)
 ''' % (Lit(before), Lit(removed), added_at, call)
 
@@ -341,7 +346,7 @@ def RunEpisode(seed, index, recorder, known, optimized, steps=None, profile=None
     ctx = Context(seed, index, recorder, known, optimized, profile)
     ctx.plant = plant
     recorder.Begin('episode %d of seed %s (profile %s)' % (index, seed, ctx.profile))
-    saved_interval = sys.getcheckinterval()
+    saved_interval = hostile.GetSwitchInterval()
     try:
         ctx.Start()
         for n in range(steps or ctx.rng.randint(8, 40)):
@@ -354,7 +359,7 @@ def RunEpisode(seed, index, recorder, known, optimized, steps=None, profile=None
         f.profile = ctx.profile
         raise
     finally:
-        sys.setcheckinterval(saved_interval)
+        hostile.SetSwitchInterval(saved_interval)
         ctx.plan.armed = False
         ctx.globals.Restore()
         ctx.threads.JoinAll(10.0)

@@ -10,6 +10,32 @@ from pysource._fastaccess import LogicalLineType
 import pysource.scopebodycache as sbc
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache
 
+# Raises again what sys.exc_info() gave, with its traceback.
+if sys.version_info[0] >= 3:
+    def _Reraise(info):
+        raise info[1].with_traceback(info[2])
+else:
+    exec('def _Reraise(info):\n    raise info[0], info[1], info[2]\n')
+
+# How often threads switch, in 2.7's unit (bytecodes; 100 by default). 3.x
+# switches after a time instead: 100 is its default 5 ms.
+if hasattr(sys, 'setcheckinterval') and sys.version_info[0] == 2:
+    GetSwitchInterval, SetSwitchInterval = sys.getcheckinterval, sys.setcheckinterval
+else:
+    def GetSwitchInterval():
+        return sys.getswitchinterval() / 5e-5
+
+    def SetSwitchInterval(interval):
+        sys.setswitchinterval(interval * 5e-5)
+
+# The other kind of text than str: 2.7's unicode, 3.x's bytes.
+kOtherText = type(u'') if str is bytes else bytes
+
+
+def Other(text):
+    return kOtherText(text) if str is bytes else text.encode('utf-8')
+
+
 kFinderSteps = ('_Clear', '_PrepareForFind', '_FindChangesEntireListAdded',
                 '_GetLeafScopeWithIndex', '_ProcessRemovedLogicals', '_ProcessAddedLogicals',
                 '_ProcessDedentedComments', '_LogicalInScopeChanged', '_SetLogicalScopeNames',
@@ -58,7 +84,7 @@ class Evil(object):
     def _Raise(self, *args):
         raise HostileError('evil')
     __index__ = __int__ = __long__ = __len__ = __iter__ = __hash__ = __eq__ = __ne__ = _Raise
-    __nonzero__ = __getitem__ = __lt__ = __gt__ = __float__ = __str__ = _Raise
+    __nonzero__ = __bool__ = __getitem__ = __lt__ = __gt__ = __float__ = __str__ = _Raise
 
     def __repr__(self):
         return 'Evil()'
@@ -91,6 +117,7 @@ class Trap(object):
 
     def __nonzero__(self):
         return bool(self._Hit())
+    __bool__ = __nonzero__
 
     def __len__(self):
         self._Hit()
@@ -111,9 +138,9 @@ def OddLogical(rng):
                 rng.choice([-5, 0, 1, 10 ** 6]), rng.choice([-4, -1, 0, 4, 32767, -32768]),
                 rng.choice([0, 1, 2, 21, 22, 3, 255]))
     if rng.random() < 0.6:
-        l.fScopeName = rng.choice([None, '', 'A#0', 5, u'x', StrSub('A#0'), 'f#1.g#0', '.'])
+        l.fScopeName = rng.choice([None, '', 'A#0', 5, Other(u'x'), StrSub('A#0'), 'f#1.g#0', '.'])
     if rng.random() < 0.6:
-        l.fLocalScopeName = rng.choice([None, 'f', 'f#0', 7, u'g#1', StrSub('f#2'), 'f#x', '#'])
+        l.fLocalScopeName = rng.choice([None, 'f', 'f#0', 7, Other(u'g#1'), StrSub('f#2'), 'f#x', '#'])
     return l
 
 
@@ -123,7 +150,7 @@ def Value(rng, lst=None, junk_only=False):
     inner = lst[rng.randrange(len(lst))] if lst else Logical(['x'])
     table = [
         None, 0, -1, 1, 2 ** 31, 2 ** 63 - 1, 2 ** 63, -2 ** 63 - 1, 2 ** 100, 1.5,
-        float('nan'), True, '', 'x', '*', u'\xe9', StrSub('A#0'), bytearray('ab'), [],
+        float('nan'), True, '', 'x', '*', Other(u'\xe9'), StrSub('A#0'), bytearray(b'ab'), [],
         ListSub([inner]), [None], [1, 2], [inner], [OddLogical(rng)], (), (inner,),
         SetSub(['']), DictSub(), frozenset(['x']), object(), Evil(),
         LogicalSub(['x'], 1, 0, 0), OddLogical(rng), (x for x in [inner]), TupleSub((1, 2)),
@@ -180,7 +207,7 @@ def _Override(base_class, step, plan, ctx):
             info = sys.exc_info()
             replaced = ctx.FilterResult(step, args, None, True)
             if replaced is None:
-                raise info[0], info[1], info[2]
+                _Reraise(info)
             return replaced
         return ctx.FilterResult(step, args, result, False)
     override.__name__ = step

@@ -222,7 +222,8 @@ class Child(object):
         data = os.read(self.proc.stdout.fileno(), 65536)
         if not data:
             return None
-        self.buf += data
+        # The child writes JSON lines, ASCII: str on 2.7, decoded on 3.x.
+        self.buf += data if isinstance(data, str) else data.decode('utf-8', 'replace')
         lines = self.buf.split('\n')
         self.buf = lines.pop()
         return lines

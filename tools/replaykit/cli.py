@@ -42,10 +42,9 @@ def SampleFiles(paths, count, seed, max_lines=None):
         kept = []
         for p in paths:
             try:
-                with open(p, 'rU') as f:
-                    if f.read().count('\n') <= max_lines:
-                        kept.append(p)
-            except (IOError, OSError):
+                if toolpath.ReadSource(p).count('\n') <= max_lines:
+                    kept.append(p)
+            except (IOError, OSError, SyntaxError, ValueError):
                 pass
         paths = kept
     if count >= len(paths):
@@ -82,8 +81,11 @@ def RunReplay(paths, seed=0, edits_per_file=150, batch_fraction=0.15, cache_chec
     for done, path in enumerate(paths):
         progress.Show(done, note='%d edits' % summary['edits'])
         try:
-            with open(path, 'rU') as f:
-                original = JoinLines(SplitLines(f.read()))
+            try:
+                source = toolpath.ReadSource(path)
+            except (SyntaxError, ValueError) as exc:  # 3.x: not decodable as declared
+                raise SourceRejected(str(exc))
+            original = JoinLines(SplitLines(source))
             doc = LiveDocument(original, cache_check, finder_class)
         except (IOError, OSError, SourceRejected) as exc:
             summary['files_rejected'] += 1
@@ -223,7 +225,7 @@ def _ParseArgs(argv):
     parser.add_argument('files', nargs='*', metavar='FILE',
                         help='files to edit (default: the bundled sample)')
     parser.add_argument('--stdlib', action='store_true',
-                        help='add every .py file of the 2.7 standard library')
+                        help='add every .py file of the running interpreter\'s standard library')
     parser.add_argument('--sample', type=int, metavar='N',
                         help='replay only N of the files, picked by the seed')
     parser.add_argument('--seed', default='0', help='random seed (default 0)')

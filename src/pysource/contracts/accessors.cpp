@@ -6,16 +6,15 @@ PyTypeObject* gLogicalLineType = nullptr;
 
 PyObject* localScopeDefinedChecked(const Logical* l) {
     PyObject* name = localScopeDefined(l);
-    if (name == nullptr || PyString_CheckExact(name)) return name;
-    msg::raiseExpectedType("bytes", name);
+    if (name == nullptr || compat::isStrExact(name)) return name;
+    msg::raiseExpectedType(compat::kNameTypeName, name);
 }
 
 NameBytes::NameBytes(PyObject* name) {
-    if (PyString_Check(name)) {
-        bytes_ = PyString_AS_STRING(name);
-    } else if (PyUnicode_Check(name)) {
-        encoded_ = py::check(PyUnicode_AsEncodedString(name, nullptr, nullptr));
-        bytes_ = PyString_AS_STRING(encoded_.get());
+    if (compat::isStr(name)) {
+        bytes_ = compat::strText(name);
+    } else if (compat::isOtherText(name)) {
+        bytes_ = compat::otherTextBytes(name, &encoded_);
     } else if (PyByteArray_Check(name)) {
         bytes_ = PyByteArray_AS_STRING(name);
     } else {

@@ -70,19 +70,18 @@ inline PyObject* definedToken(const Logical* l) noexcept {
     const std::string_view keyword = isDef ? "def" : "class";
     // Compared up to the first NUL, as the bytes of a C string: equal when
     // the token is the word, or the word followed by a NUL.
-    auto is = [](PyObject* token, std::string_view word) {
-        const auto size = static_cast<size_t>(PyString_GET_SIZE(token));
-        const char* text = PyString_AS_STRING(token);
-        return size >= word.size() && (size == word.size() || text[word.size()] == '\0') &&
-               std::memcmp(text, word.data(), word.size()) == 0;
+    auto is = [](std::string_view text, std::string_view word) {
+        return text.size() >= word.size() && (text.size() == word.size() || text[word.size()] == '\0') &&
+               text.compare(0, word.size(), word) == 0;
     };
     for (Py_ssize_t i = 0; i < l->fTokenCount; ++i) {
         PyObject* token = l->fTokens[i];
-        if (PyString_Check(token)) {
-            const char* text = PyString_AS_STRING(token);
+        std::string_view bytes;
+        if (compat::isStr(token) && compat::tryStrView(token, &bytes)) {
+            const char* text = bytes.data();
             if (text[0] == '\\') continue;
-            if (text[0] == keyword[0] && is(token, keyword)) continue;
-            if (isDef && text[0] == 'a' && is(token, "async")) continue;
+            if (text[0] == keyword[0] && is(bytes, keyword)) continue;
+            if (isDef && text[0] == 'a' && is(bytes, "async")) continue;
         }
         return token;
     }
@@ -104,8 +103,9 @@ inline void setLocalScopeDefined(Logical* l, PyObject* name) noexcept {
     py::storeSlot(&l->fLocalScopeName, name == Py_None ? nullptr : name);
 }
 
-// The bytes of a name: a str directly, a unicode through the default
-// encoding, a bytearray's buffer; anything else is a TypeError.
+// The bytes of a name: a str directly (its UTF-8 on 3.x), 2.7's unicode
+// through the default encoding, 3.x's bytes as they are, a bytearray's
+// buffer; anything else is a TypeError.
 class NameBytes {
 public:
     explicit NameBytes(PyObject* name);
@@ -118,13 +118,12 @@ private:
 
 // Whether two names have the same bytes up to the first NUL.
 inline bool strEquals(PyObject* a, PyObject* b) {
-    if (a == b && PyString_CheckExact(a)) return true;
-    if (PyString_CheckExact(a) && PyString_CheckExact(b)) {
-        if (PyString_GET_SIZE(a) == PyString_GET_SIZE(b) &&
-            std::memcmp(PyString_AS_STRING(a), PyString_AS_STRING(b), PyString_GET_SIZE(a)) == 0) {
-            return true;
-        }
-        return std::strcmp(PyString_AS_STRING(a), PyString_AS_STRING(b)) == 0;
+    if (a == b && compat::isStrExact(a)) return true;
+    if (compat::isStrExact(a) && compat::isStrExact(b)) {
+        const std::string_view x = compat::strView(a);
+        const std::string_view y = compat::strView(b);
+        if (x == y) return true;
+        return std::strcmp(x.data(), y.data()) == 0;
     }
     NameBytes c(b);
     NameBytes s(a);

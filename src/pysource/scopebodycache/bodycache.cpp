@@ -23,6 +23,7 @@ Py_ssize_t gBodyCacheStateOffset = 0;
 namespace {
 
 PyTypeObject BodyCacheType = {PyVarObject_HEAD_INIT(nullptr, 0)};
+PyTypeObject* gBodyCacheType = &BodyCacheType;  // the class in use (see Slots::ready)
 
 // --- Small helpers with the semantics of the Python operations ------------
 
@@ -126,8 +127,8 @@ py::Ref indexBody(PyObject* body) {
         if (!logicalCheck(item)) return py::Ref::none();
         PyObject* defined = localScopeDefined(asLogical(item));
         if (defined == nullptr) continue;
-        if (!PyString_CheckExact(defined)) return py::Ref::none();
-        py::Ref position = py::check(PyInt_FromSsize_t(i));
+        if (!compat::isStrExact(defined)) return py::Ref::none();
+        py::Ref position = py::check(compat::intFromSsize(i));
         if (py::checkStatus(PyDict_Contains(names.get(), defined)) == 0) {
             py::checkStatus(PyDict_SetItem(names.get(), defined, position.get()));
         }
@@ -140,7 +141,7 @@ py::Ref indexBody(PyObject* body) {
 // `absent` when the index knows that no definition has that name.
 py::Ref findInIndexedBody(PyObject* self, PyObject* scopeName, PyObject* body, PyObject* leaf, bool* absent) {
     *absent = false;
-    if (!PyString_CheckExact(scopeName) || !PyString_CheckExact(leaf) || !PyList_CheckExact(body)) return {};
+    if (!compat::isStrExact(scopeName) || !compat::isStrExact(leaf) || !PyList_CheckExact(body)) return {};
     // A short body is scanned faster than an index is built.
     if (PyList_GET_SIZE(body) < 16) return {};
     BodyCacheState& s = bodyCacheState(self);
@@ -149,9 +150,9 @@ py::Ref findInIndexedBody(PyObject* self, PyObject* scopeName, PyObject* body, P
     py::Ref entry = py::Ref::own(PyDict_GetItem(indexes.get(), scopeName));
     const Py_ssize_t size = PyList_GET_SIZE(body);
     if (!entry || PyTuple_GET_ITEM(entry.get(), 0) != body ||
-        PyInt_AS_LONG(PyTuple_GET_ITEM(entry.get(), 1)) != size) {
+        compat::smallIntValue(PyTuple_GET_ITEM(entry.get(), 1)) != size) {
         py::Ref names = indexBody(body);
-        py::Ref length = py::check(PyInt_FromSsize_t(size));
+        py::Ref length = py::check(compat::intFromSsize(size));
         entry = py::check(PyTuple_Pack(3, body, length.get(), names.get()));
         py::checkStatus(PyDict_SetItem(indexes.get(), scopeName, entry.get()));
     }
@@ -163,12 +164,12 @@ py::Ref findInIndexedBody(PyObject* self, PyObject* scopeName, PyObject* body, P
         return {};
     }
     // The one it names is checked: still there, still of that name.
-    const Py_ssize_t i = PyInt_AS_LONG(position);
+    const Py_ssize_t i = compat::smallIntValue(position);
     if (i >= PyList_GET_SIZE(body)) return {};
     PyObject* item = PyList_GET_ITEM(body, i);
     if (!logicalCheck(item)) return {};
     PyObject* defined = localScopeDefined(asLogical(item));
-    if (defined == nullptr || !PyString_CheckExact(defined) || !_PyString_Eq(defined, leaf)) return {};
+    if (defined == nullptr || !compat::isStrExact(defined) || !compat::strEqual(defined, leaf)) return {};
     return py::Ref::own(item);
 }
 
@@ -203,7 +204,7 @@ py::Ref parentScopeName(PyObject* parts, Py_ssize_t count) {
 // The parent's name and the leaf of a full name, as SplitScopeNames and the
 // join of all but the last part give them.
 void splitParent(PyObject* scopeName, py::Ref* parentName, py::Ref* leafName) {
-    const Py_ssize_t cut = gNative.scopeNameParentLength != nullptr && PyString_CheckExact(scopeName)
+    const Py_ssize_t cut = gNative.scopeNameParentLength != nullptr && compat::isStrExact(scopeName)
                                ? gNative.scopeNameParentLength(scopeName)
                                : -2;
     if (cut == -1) {
@@ -212,9 +213,10 @@ void splitParent(PyObject* scopeName, py::Ref* parentName, py::Ref* leafName) {
         return;
     }
     if (cut >= 0) {
-        const char* text = PyString_AS_STRING(scopeName);
-        *parentName = py::check(PyString_FromStringAndSize(text, cut));
-        *leafName = py::check(PyString_FromStringAndSize(text + cut + 1, PyString_GET_SIZE(scopeName) - cut - 1));
+        const std::string_view text = compat::strView(scopeName);
+        *parentName = py::check(compat::strFromBytes(text.data(), cut));
+        *leafName = py::check(compat::strFromBytes(text.data() + cut + 1,
+                                                   static_cast<Py_ssize_t>(text.size()) - cut - 1));
         return;
     }
     py::Ref parts = splitScopeNames(scopeName);
@@ -380,7 +382,7 @@ const FunctionSpec kMethods[] = {
 
 }  // namespace
 
-PyTypeObject* scopeBodyCacheType() noexcept { return &BodyCacheType; }
+PyTypeObject* scopeBodyCacheType() noexcept { return gBodyCacheType; }
 
 void dropBodyIndexes(PyObject* self) noexcept { bodyCacheState(self).clearInternal(); }
 
@@ -389,9 +391,9 @@ void readyScopeBodyCacheType() {
     Slots::fillType(BodyCacheType);
     BodyCacheType.tp_init = cache_init;
     BodyCacheType.tp_getset = cache_getset;
-    py::checkStatus(PyType_Ready(&BodyCacheType));
+    gBodyCacheType = Slots::ready(BodyCacheType);
 }
 
-void bindScopeBodyCacheMethods() { bindMethods(&BodyCacheType, kMethods, kModuleName); }
+void bindScopeBodyCacheMethods() { bindMethods(gBodyCacheType, kMethods, kModuleName); }
 
 }  // namespace sbc

@@ -13,14 +13,10 @@ using namespace contracts;
 namespace {
 
 bool sameStr(PyObject* a, PyObject* b) noexcept {
-    return a == b || (PyString_GET_SIZE(a) == PyString_GET_SIZE(b) &&
-                      std::memcmp(PyString_AS_STRING(a), PyString_AS_STRING(b), PyString_GET_SIZE(a)) == 0);
+    return a == b || compat::strViewOrEmpty(a) == compat::strViewOrEmpty(b);
 }
 
-bool sameBytes(PyObject* s, std::string_view bytes) noexcept {
-    return static_cast<size_t>(PyString_GET_SIZE(s)) == bytes.size() &&
-           std::memcmp(PyString_AS_STRING(s), bytes.data(), bytes.size()) == 0;
-}
+bool sameBytes(PyObject* s, std::string_view bytes) noexcept { return compat::strViewOrEmpty(s) == bytes; }
 
 struct LaterFirst {
     bool operator()(const DefIndex::Candidate& a, const DefIndex::Candidate& b) const noexcept {
@@ -39,10 +35,11 @@ bool readDefinedName(PyObject* logical, DefinedName* out) {
 }
 
 py::Ref bareNameOf(PyObject* logical, const DefinedName& name) {
-    if (name.bareLength == PyString_GET_SIZE(name.name)) return py::Ref::own(name.name);
+    const std::string_view whole = compat::strView(name.name);
+    if (name.bareLength == static_cast<Py_ssize_t>(whole.size())) return py::Ref::own(name.name);
     PyObject* token = definedToken(asLogical(logical));
-    if (token != nullptr && PyString_CheckExact(token) && sameBytes(token, name.bare())) return py::Ref::own(token);
-    return py::check(PyString_FromStringAndSize(PyString_AS_STRING(name.name), name.bareLength));
+    if (token != nullptr && compat::isStrExact(token) && sameBytes(token, name.bare())) return py::Ref::own(token);
+    return py::check(compat::strFromBytes(whole.data(), name.bareLength));
 }
 
 DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(64, nullptr) {}
@@ -216,7 +213,7 @@ bool DefIndex::rebuild() {
         DefinedName name;
         // Not named yet (added in this call): filed when it is visited.
         if (scope == Py_None || !readDefinedName(item, &name)) continue;
-        if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return false;
+        if (!compat::isStrExact(scope) || !compat::isStrExact(name.name)) return false;
         append(item, j, scope, name);
     }
     // A stored index that is not the position is repaired when the pass
@@ -276,7 +273,7 @@ bool DefIndex::place(PyObject* def, Py_ssize_t at) {
     PyObject* scope = scopeName(asLogical(def));
     DefinedName name;
     if (scope == Py_None || !readDefinedName(def, &name)) return true;
-    if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return false;
+    if (!compat::isStrExact(scope) || !compat::isStrExact(name.name)) return false;
     Group& group = findOrAdd(scope, name, hashOf(scope, name.bare()));
     const Py_ssize_t position = lowerBound(group, at);
     if (position < 0) {
@@ -291,7 +288,7 @@ bool DefIndex::place(PyObject* def, Py_ssize_t at) {
 }
 
 Py_ssize_t DefIndex::countBefore(PyObject* scope, const DefinedName& name, Py_ssize_t at) {
-    if (!PyString_CheckExact(scope) || !PyString_CheckExact(name.name)) return -1;
+    if (!compat::isStrExact(scope) || !compat::isStrExact(name.name)) return -1;
     Group* group = find(scope, name.bare(), hashOf(scope, name.bare()));
     return group == nullptr ? 0 : lowerBound(*group, at);
 }
@@ -340,7 +337,7 @@ bool DefIndex::matchesList(std::string* why) {
     for (Group* g : fresh.slots_) {
         if (g == nullptr) continue;
         Group* mine = find(g->scope.get(), g->bare(), g->hash);
-        const std::string key = std::string(PyString_AS_STRING(g->scope.get())) + " / " + std::string(g->bare());
+        const std::string key = std::string(compat::strViewOrEmpty(g->scope.get())) + " / " + std::string(g->bare());
         if (mine == nullptr || mine->members.size() != g->members.size()) {
             *why = "the group " + key + " differs";
             return false;

@@ -15,6 +15,7 @@
 // dropped whenever it cannot be shown to match the list (see finder.hpp).
 #pragma once
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 #include "common/small_vector.hpp"
 
@@ -115,7 +116,7 @@ struct DefinedName {
     Py_ssize_t bareLength = 0;
     Py_ssize_t index = -1;
     std::string_view bare() const noexcept {
-        return {PyString_AS_STRING(name), static_cast<size_t>(bareLength)};
+        return compat::strViewOrEmpty(name).substr(0, static_cast<size_t>(bareLength));
     }
 };
 
@@ -192,7 +193,7 @@ private:
         size_t hash = 0;
         SmallVector<Member, 2> members;  // most keys have one definition
         std::string_view bare() const noexcept {
-            return {PyString_AS_STRING(bareSource.get()), static_cast<size_t>(bareLength)};
+            return compat::strViewOrEmpty(bareSource.get()).substr(0, static_cast<size_t>(bareLength));
         }
     };
 

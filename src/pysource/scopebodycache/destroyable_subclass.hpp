@@ -3,6 +3,7 @@
 // turned out to be at import, and take part in garbage collection.
 #pragma once
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 #include "pysource/contracts/destroyable_base.hpp"
 #include "pysource/scopebodycache/function.hpp"
@@ -26,6 +27,16 @@ struct DestroyableSubclass {
 
     // The base allocates zeroed memory: indices start at 0, objects at None.
     static PyObject* tp_new(PyTypeObject* type, PyObject* args, PyObject* kwargs) {
+        // A base written in Python may leave __new__ to object's, which
+        // takes no arguments of its own: 2.7 lets a class with its own
+        // __init__ pass them (with a warning), 3.x refuses them.
+        py::Ref noArgs;
+        if (compat::kObjectNewRefusesArguments && gDestroyableType->tp_new == PyBaseObject_Type.tp_new) {
+            noArgs = py::Ref::steal(PyTuple_New(0));
+            if (!noArgs) return nullptr;
+            args = noArgs.get();
+            kwargs = nullptr;
+        }
         PyObject* self = gDestroyableType->tp_new(type, args, kwargs);
         if (self == nullptr) return nullptr;
         state(self).forEachObject([](PyObject*& field) {
@@ -37,6 +48,7 @@ struct DestroyableSubclass {
 
     static int tp_traverse(PyObject* self, visitproc visit, void* arg) {
         int status = 0;
+        if (compat::kInstancesOwnHeapType && heap) Py_VISIT(Py_TYPE(self));
         state(self).forEachObject([&](PyObject* field) {
             if (status == 0 && field != nullptr) status = visit(field, arg);
         });
@@ -66,8 +78,16 @@ struct DestroyableSubclass {
             return;
         }
         Py_CLEAR(base(self)->fSignalCatchers);
-        Py_TYPE(self)->tp_free(self);
+        PyTypeObject* type = Py_TYPE(self);
+        type->tp_free(self);
+        if (compat::kInstancesOwnHeapType && heap) Py_DECREF(type);
     }
+
+    // Whether the class was made as a heap type (compat::readyType).
+    static inline bool heap = false;
+
+    // Makes the filled-in type ready; returns the class to use.
+    static PyTypeObject* ready(PyTypeObject& type) { return compat::readyType(&type, &heap); }
 
     static void fillType(PyTypeObject& type) noexcept {
         type.tp_basicsize = layout();

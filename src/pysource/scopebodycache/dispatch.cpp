@@ -20,7 +20,7 @@ StepEntry gSteps[static_cast<int>(Step::Count)];
 
 void internStepNames() {
     for (int k = 0; k < static_cast<int>(Step::Count); ++k) {
-        gSteps[k].name = py::check(PyString_InternFromString(kSteps[k].name)).release();
+        gSteps[k].name = py::check(compat::internStr(kSteps[k].name)).release();
         gSteps[k].context = std::string("pysource.scopebodycache.CChangeFinder.") + kSteps[k].name;
     }
 }

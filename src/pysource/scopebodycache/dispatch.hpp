@@ -3,6 +3,7 @@
 // by attribute lookup that is not our own built-in method runs instead.
 #pragma once
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 
 namespace sbc {
@@ -77,7 +78,7 @@ py::Ref findOverride(PyObject* self, Step step);
 bool mayOverride(PyObject* self, Step step) noexcept;
 
 inline py::Ref toPython(PyObject* o) { return py::Ref::own(o ? o : Py_None); }
-inline py::Ref toPython(Py_ssize_t v) { return py::check(PyInt_FromSsize_t(v)); }
+inline py::Ref toPython(Py_ssize_t v) { return py::check(compat::intFromSsize(v)); }
 
 template <class... Args>
 py::Ref callOverride(const py::Ref& override, Args... args) {

@@ -182,7 +182,7 @@ private:
 };
 
 // Shared helpers of the passes.
-inline bool assertionsOn() noexcept { return Py_OptimizeFlag == 0; }
+inline bool assertionsOn() noexcept { return !compat::optimized(); }
 void assertThat(bool condition);  // the assert statement: see above
 Py_ssize_t logicalListLength(PyObject* self);
 // list[i] with ordinary list indexing, checked to be a logical and owned:

@@ -108,7 +108,7 @@ Py_ssize_t PlaceCommentRun(PyObject* self, Py_ssize_t first, Py_ssize_t end, con
         referenceIndent = logicalAt(self, end)->fIndent;
         baseScope = knownBase != nullptr ? knownBase->copy() : route::FindScopeNameContainingLogical(self, end);
     }
-    if (nativePass(self) && PyString_CheckExact(baseScope.get())) {
+    if (nativePass(self) && compat::isStrExact(baseScope.get())) {
         RunAnchor anchor(self, first);
         if (anchor.known()) {
             for (Py_ssize_t j = first; j < end; ++j) {

@@ -49,7 +49,7 @@ void requireScopeFound(PyObject* scope, Py_ssize_t i) {
 }
 
 void requireStrOrNone(PyObject* name) {
-    if (name != Py_None && !PyString_CheckExact(name)) msg::raiseExpectedType("str", name);
+    if (name != Py_None && !compat::isStrExact(name)) msg::raiseExpectedType("str", name);
 }
 
 void unpackPair(PyObject* seq, py::Ref* first, py::Ref* second, bool firstTwo) {

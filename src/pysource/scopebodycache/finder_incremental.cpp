@@ -134,7 +134,7 @@ bool ProcessTypedLine(PyObject* self, PyObject* addedList, PyObject* removedList
     Logical* r = asLogical(removed);
     if (isScopeStart(a) || isWhitespace(a) || isScopeStart(r)) return false;
     PyObject* removedScope = scopeName(r);
-    if (!PyString_CheckExact(removedScope)) return false;
+    if (!compat::isStrExact(removedScope)) return false;
     // The removed line maps to where the added one stands, with no comment
     // run before it to place: otherwise the general steps take the edit.
     FinderState& s = finderState(self);
@@ -238,7 +238,7 @@ void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedI
             ++k;
             continue;
         }
-        if (!PyString_CheckExact(scope.get())) msg::raiseExpectedType("str", scope.get());
+        if (!compat::isStrExact(scope.get())) msg::raiseExpectedType("str", scope.get());
         // Recorded before the update, while a class/def still carries its
         // old local name, so that its old full name is in the change sets.
         route::LogicalInScopeChanged(self, item.get(), previous.get());

@@ -49,7 +49,7 @@ py::Ref GetLeafScopeWithIndex(PyObject* self, PyObject* logicalObj, Py_ssize_t s
     Logical* logical = requireLogical(logicalObj);
     py::Ref name = py::Ref::own(localScopeDefined(logical));
     if (!name) return py::Ref::none();
-    py::Ref index = py::check(PyInt_FromSsize_t(scopeIndex));
+    py::Ref index = py::check(compat::intFromSsize(scopeIndex));
     if (nativePass(self)) {
         DefinedName defined;
         readDefinedName(logicalObj, &defined);

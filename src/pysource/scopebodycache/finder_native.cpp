@@ -98,7 +98,7 @@ void IndexList::append(Py_ssize_t value) {
         vector_->push_back(value);
         return;
     }
-    py::Ref v = py::check(PyInt_FromSsize_t(value));
+    py::Ref v = py::check(compat::intFromSsize(value));
     py::checkStatus(PyList_Append(requireIndexList(list_, "append"), v.get()));
 }
 
@@ -116,7 +116,7 @@ void IndexList::insert(Py_ssize_t k, Py_ssize_t value) {
         vector_->insert(static_cast<size_t>(k), value);
         return;
     }
-    py::Ref v = py::check(PyInt_FromSsize_t(value));
+    py::Ref v = py::check(compat::intFromSsize(value));
     py::checkStatus(PyList_Insert(list_, k, v.get()));
 }
 

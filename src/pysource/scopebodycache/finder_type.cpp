@@ -14,6 +14,7 @@ Py_ssize_t gFinderStateOffset = 0;
 namespace {
 
 PyTypeObject FinderType = {PyVarObject_HEAD_INIT(nullptr, 0)};
+PyTypeObject* gFinderType = &FinderType;  // the class in use (see Slots::ready)
 
 const char kClassDoc[] =
     " Finds changes in logical list and updates fScopeName attribute on all\n"
@@ -119,7 +120,7 @@ PyObject* m_ProcessDedentedComments(PyObject* self, PyObject* const* a) {
     const Py_ssize_t first = py::asIndex(a[0]);
     const Py_ssize_t end = route::builtin<Step::ProcessDedentedComments>(finder::ProcessDedentedComments,
                                                                          self, first);
-    return py::check(PyInt_FromSsize_t(end)).release();
+    return py::check(compat::intFromSsize(end)).release();
 }
 PyObject* m_LogicalInScopeChanged(PyObject* self, PyObject* const* a) {
     dropDefinitionIndex(self);
@@ -155,7 +156,7 @@ PyObject* m_FindScopeIndexForLogical(PyObject* self, PyObject* const* a) {
     const Py_ssize_t i = py::asIndex(a[1]);
     const Py_ssize_t index = route::builtin<Step::FindScopeIndexForLogical>(
         finder::FindScopeIndexForLogical, self, a[0], i);
-    return py::check(PyInt_FromSsize_t(index)).release();
+    return py::check(compat::intFromSsize(index)).release();
 }
 PyObject* m_FindScopeNameContainingLogical(PyObject* self, PyObject* const* a) {
     dropDefinitionIndex(self);
@@ -224,7 +225,7 @@ const FunctionSpec kMethods[] = {
 
 }  // namespace
 
-PyTypeObject* changeFinderType() noexcept { return &FinderType; }
+PyTypeObject* changeFinderType() noexcept { return gFinderType; }
 
 void readyChangeFinderType() {
     FinderType.tp_name = "pysource.scopebodycache.CChangeFinder";
@@ -232,12 +233,12 @@ void readyChangeFinderType() {
     FinderType.tp_doc = kClassDoc;
     FinderType.tp_init = finder_init;
     FinderType.tp_getset = finder_getset;
-    py::checkStatus(PyType_Ready(&FinderType));
+    gFinderType = Slots::ready(FinderType);
 }
 
 void bindChangeFinderMethods() {
-    bindMethods(&FinderType, kMethods, kModuleName);
-    registerSteps(&FinderType);
+    bindMethods(gFinderType, kMethods, kModuleName);
+    registerSteps(gFinderType);
 }
 
 }  // namespace sbc

@@ -6,7 +6,7 @@
 #include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
-#include <cstring>
+#include <string_view>
 #include <vector>
 
 namespace sbc::finder {
@@ -29,8 +29,8 @@ struct OpenScope {
 bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t i, PyObject* top,
                           py::Ref* full) {
     DefinedName name;
-    if (!readDefinedName(logical.get(), &name) || !PyString_CheckExact(name.name) ||
-        !PyString_CheckExact(top)) {
+    if (!readDefinedName(logical.get(), &name) || !compat::isStrExact(name.name) ||
+        !compat::isStrExact(top)) {
         return false;
     }
     const Py_ssize_t index = CountDefinition(self, logical.get(), i, top, &name);
@@ -38,7 +38,7 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
     if (name.index == index) {
         local = py::Ref::own(name.name);
     } else {
-        py::Ref number = py::check(PyInt_FromSsize_t(index));
+        py::Ref number = py::check(compat::intFromSsize(index));
         local = appendScopeSuffixes(bareNameOf(logical.get(), name).get(), number.get());
     }
     *full = joinTwoScopeNames(top, local.get());
@@ -58,8 +58,9 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
 }
 
 bool sameExactStr(PyObject* a, PyObject* b) noexcept {
-    return PyString_CheckExact(a) && PyString_CheckExact(b) && PyString_GET_SIZE(a) == PyString_GET_SIZE(b) &&
-           std::memcmp(PyString_AS_STRING(a), PyString_AS_STRING(b), PyString_GET_SIZE(a)) == 0;
+    std::string_view x, y;
+    return compat::isStrExact(a) && compat::isStrExact(b) && compat::tryStrView(a, &x) &&
+           compat::tryStrView(b, &y) && x == y;
 }
 
 // The native pass over a stretch of plain lines (the bulk of a file): the

@@ -18,6 +18,7 @@ struct FunctionObject {
     PyObject* doc;       // str or None
     PyTypeObject* owner; // the class of a method, else nullptr
     bool isMethod;
+    SBC_VECTORCALL_MEMBER(vectorcall)
 };
 
 PyTypeObject FunctionType = {PyVarObject_HEAD_INIT(nullptr, 0)};
@@ -42,7 +43,7 @@ PyTypeObject FunctionType = {PyVarObject_HEAD_INIT(nullptr, 0)};
 const char* checkTypeName(ArgCheck check, PyTypeObject** type) {
     switch (check) {
     case ArgCheck::List: *type = &PyList_Type; return "list";
-    case ArgCheck::Str: *type = &PyString_Type; return "str";
+    case ArgCheck::Str: *type = compat::strType(); return "str";
     case ArgCheck::Set: *type = &PySet_Type; return "set";
     case ArgCheck::Any: break;
     }
@@ -51,7 +52,7 @@ const char* checkTypeName(ArgCheck check, PyTypeObject** type) {
 }
 
 int indexOfParam(const FunctionSpec& spec, PyObject* key) {
-    const char* text = PyString_AS_STRING(key);
+    const char* text = compat::strText(key);
     for (int i = 0; i < spec.total; ++i) {
         if (std::strcmp(spec.params[i].name, text) == 0) return i;
     }
@@ -60,23 +61,33 @@ int indexOfParam(const FunctionSpec& spec, PyObject* key) {
 
 }  // namespace
 
+namespace {
+
+// The common call: every parameter by position, none by keyword. False,
+// having done nothing, for any other call.
+bool parsePositional(const FunctionSpec& spec, PyObject* const* items, Py_ssize_t nargs, ParsedArgs& out) {
+    if (nargs != spec.total || spec.total == 0 || (spec.total == 1 && spec.isInit)) return false;
+    for (int i = 0; i < spec.total; ++i) {
+        PyObject* v = items[i];
+        PyTypeObject* type;
+        const char* typeName = checkTypeName(spec.params[i].check, &type);
+        if (type != nullptr && v != Py_None && Py_TYPE(v) != type) {
+            PyErr_Format(PyExc_TypeError, msg::kArgumentType, spec.params[i].name, typeName,
+                         Py_TYPE(v)->tp_name);
+            py::fail();
+        }
+        out.set(i, v);
+    }
+    return true;
+}
+
+}  // namespace
+
 void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObject* kwargs,
                ParsedArgs& out) {
     const Py_ssize_t nargs = PyTuple_GET_SIZE(args) - first;
     const bool haveKeywords = kwargs != nullptr && PyDict_Size(kwargs) > 0;
-    // The common call: every parameter by position.
-    if (!haveKeywords && nargs == spec.total && spec.total > 0 && !(spec.total == 1 && spec.isInit)) {
-        for (int i = 0; i < spec.total; ++i) {
-            PyObject* v = PyTuple_GET_ITEM(args, first + i);
-            PyTypeObject* type;
-            const char* typeName = checkTypeName(spec.params[i].check, &type);
-            if (type != nullptr && v != Py_None && Py_TYPE(v) != type) {
-                PyErr_Format(PyExc_TypeError, msg::kArgumentType, spec.params[i].name, typeName,
-                             Py_TYPE(v)->tp_name);
-                py::fail();
-            }
-            out.set(i, v);
-        }
+    if (!haveKeywords && parsePositional(spec, &PyTuple_GET_ITEM(args, first), nargs, out)) {
         return;
     }
 
@@ -117,21 +128,21 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObj
                 PyObject* value;
                 Py_ssize_t pos = 0;
                 while (PyDict_Next(kwargs, &pos, &key, &value)) {
-                    if (!PyString_Check(key)) {
-                        PyErr_Format(PyExc_TypeError, "%.200s() keywords must be strings", spec.name);
+                    if (!compat::isStr(key)) {
+                        PyErr_Format(PyExc_TypeError, msg::kKeywordsMustBeStrings, spec.name);
                         py::fail();
                     }
                     const int at = indexOfParam(spec, key);
                     if (at < 0) {
                         PyErr_Format(PyExc_TypeError,
                                      "%.200s() got an unexpected keyword argument '%.200s'",
-                                     spec.name, PyString_AS_STRING(key));
+                                     spec.name, compat::strText(key));
                         py::fail();
                     }
                     if (at < nargs) {
                         PyErr_Format(PyExc_TypeError,
                                      "%s() got multiple values for keyword argument '%s'", spec.name,
-                                     PyString_AS_STRING(key));
+                                     compat::strText(key));
                         py::fail();
                     }
                 }
@@ -156,31 +167,55 @@ void parseArgs(const FunctionSpec& spec, PyObject* args, Py_ssize_t first, PyObj
 
 namespace {
 
+// The instance a method is called on: the first argument.
+PyObject* methodSelf(FunctionObject* f, PyObject* const* items, Py_ssize_t nargs) {
+    // Reached unbound, the first argument is the instance.
+    if (nargs < 1) {
+        PyErr_Format(PyExc_TypeError, "descriptor '%.200s' needs an argument", compat::strText(f->qualname));
+        py::fail();
+    }
+    PyObject* self = items[0];
+    // Taken from the class dict, a method can be handed anything.
+    if (!PyObject_TypeCheck(self, f->owner)) {
+        PyErr_Format(PyExc_TypeError, "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
+                     compat::strText(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
+        py::fail();
+    }
+    return self;
+}
+
 PyObject* function_call(PyObject* op, PyObject* args, PyObject* kwargs) {
     auto* f = reinterpret_cast<FunctionObject*>(op);
     return py::guarded([&]() -> PyObject* {
         PyObject* self = nullptr;
-        if (f->isMethod) {
-            // Reached unbound, the first argument is the instance.
-            if (PyTuple_GET_SIZE(args) < 1) {
-                PyErr_Format(PyExc_TypeError, "descriptor '%.200s' needs an argument",
-                             PyString_AS_STRING(f->qualname));
-                py::fail();
-            }
-            self = PyTuple_GET_ITEM(args, 0);
-            // Taken from the class dict, a method can be handed anything.
-            if (!PyObject_TypeCheck(self, f->owner)) {
-                PyErr_Format(PyExc_TypeError,
-                             "descriptor '%.200s' requires a '%.100s' object but received a '%.100s'",
-                             PyString_AS_STRING(f->name), f->owner->tp_name, Py_TYPE(self)->tp_name);
-                py::fail();
-            }
-        }
+        if (f->isMethod) self = methodSelf(f, &PyTuple_GET_ITEM(args, 0), PyTuple_GET_SIZE(args));
         ParsedArgs parsed;
         parseArgs(*f->spec, args, f->isMethod ? 1 : 0, kwargs, parsed);
         return f->spec->impl(self, parsed.argv());
     });
 }
+
+#if SBC_HAVE_VECTORCALL
+// 3.x's call without an argument tuple (a bound method passes the instance
+// first). Calls with keywords take the general path.
+PyObject* function_vectorcall(PyObject* op, PyObject* const* args, size_t nargsf, PyObject* kwnames) {
+    auto* f = reinterpret_cast<FunctionObject*>(op);
+    const Py_ssize_t nargs = PyVectorcall_NARGS(nargsf);
+    if (kwnames == nullptr || PyTuple_GET_SIZE(kwnames) == 0) {
+        PyObject* result = nullptr;
+        const bool done = py::guardedAs<bool>(true, [&] {
+            PyObject* self = f->isMethod ? methodSelf(f, args, nargs) : nullptr;
+            const Py_ssize_t first = f->isMethod ? 1 : 0;
+            ParsedArgs parsed;
+            if (!parsePositional(*f->spec, args + first, nargs - first, parsed)) return false;
+            result = f->spec->impl(self, parsed.argv());
+            return true;
+        });
+        if (done) return result;
+    }
+    return compat::vectorcallThroughTuple(function_call, op, args, nargs, kwnames);
+}
+#endif
 
 PyObject* function_descr_get(PyObject* op, PyObject* obj, PyObject* type) {
     auto* f = reinterpret_cast<FunctionObject*>(op);
@@ -189,7 +224,7 @@ PyObject* function_descr_get(PyObject* op, PyObject* obj, PyObject* type) {
         return op;
     }
     if (obj == Py_None) obj = nullptr;
-    return PyMethod_New(op, obj, type);
+    return compat::methodFor(op, obj, type);
 }
 
 void function_dealloc(PyObject* op) {
@@ -204,7 +239,9 @@ void function_dealloc(PyObject* op) {
 
 PyObject* function_repr(PyObject* op) {
     auto* f = reinterpret_cast<FunctionObject*>(op);
-    return PyString_FromFormat("<function %s at %p>", PyString_AS_STRING(f->qualname), op);
+    return py::guarded([&] {
+        return compat::strFromFormat("<function %s at %p>", compat::strText(f->qualname), op);
+    });
 }
 
 // Pickled by reference: module and name.
@@ -236,10 +273,13 @@ py::Ref makeFunction(const FunctionSpec& spec, const char* qualname, const char*
     f->isMethod = isMethod;
     f->owner = owner;
     Py_XINCREF(owner);
-    f->name = py::check(PyString_InternFromString(spec.name)).release();
-    f->qualname = py::check(PyString_FromString(qualname)).release();
-    f->module = py::check(PyString_InternFromString(module)).release();
-    f->doc = spec.doc ? py::check(PyString_FromString(spec.doc)).release() : py::Ref::none().release();
+    f->name = py::check(compat::internStr(spec.name)).release();
+    f->qualname = py::check(compat::strFromText(qualname)).release();
+    f->module = py::check(compat::internStr(module)).release();
+    f->doc = spec.doc ? py::check(compat::strFromText(spec.doc)).release() : py::Ref::none().release();
+#if SBC_HAVE_VECTORCALL
+    f->vectorcall = function_vectorcall;
+#endif
     return op;
 }
 
@@ -255,6 +295,9 @@ void readyFunctionType() {
     FunctionType.tp_descr_get = function_descr_get;
     FunctionType.tp_methods = function_methods;
     FunctionType.tp_members = function_members;
+#if SBC_HAVE_VECTORCALL
+    compat::enableVectorcall(&FunctionType, offsetof(FunctionObject, vectorcall));
+#endif
     py::checkStatus(PyType_Ready(&FunctionType));
 }
 
@@ -265,8 +308,8 @@ py::Ref newFunction(const FunctionSpec& spec, const char* module) {
 py::Ref newMethod(const FunctionSpec& spec, PyTypeObject* owner, const char* module) {
     const char* dot = std::strrchr(owner->tp_name, '.');
     py::Ref qual = py::check(
-        PyString_FromFormat("%s.%s", dot ? dot + 1 : owner->tp_name, spec.name));
-    return makeFunction(spec, PyString_AS_STRING(qual.get()), module, owner);
+        compat::strFromFormat("%s.%s", dot ? dot + 1 : owner->tp_name, spec.name));
+    return makeFunction(spec, compat::strText(qual.get()), module, owner);
 }
 
 void bindMethods(PyTypeObject* type, const FunctionSpec* specs, size_t count, const char* module) {

@@ -11,9 +11,8 @@
 #include "pysource/scopebodycache/siblings.hpp"
 #include "pysource/scopebodycache/utilities.hpp"
 
-#include <frameobject.h>
-
 #include <cstdlib>
+#include <cstring>
 
 namespace sbc {
 namespace {
@@ -24,13 +23,21 @@ const char kModuleDoc[] =
     "Scope names of logical lines kept up to date while a file is edited, and a\n"
     "cache of scope definitions and bodies by full dotted name.";
 
+compat::ModuleDef gModuleDef = SBC_MODULE_DEF("scopebodycache", kModuleDoc, nullptr);
+
 void checkVersion() {
     char built[16];
     PyOS_snprintf(built, sizeof built, "%d.%d", PY_MAJOR_VERSION, PY_MINOR_VERSION);
-    char running[4] = {0, 0, 0, 0};
+    // "X.Y" of the running version: up to its second dot (or the end of
+    // the digits), so that 3.1 is not taken for 3.11.
+    char running[16] = {0};
     const char* version = Py_GetVersion();
-    for (int k = 0; k < 3 && version[k] != '\0'; ++k) running[k] = version[k];
-    if (built[0] != running[0] || built[2] != running[2]) {
+    for (int k = 0, dots = 0; k < 15 && version[k] != '\0'; ++k) {
+        if (version[k] == '.' && ++dots == 2) break;
+        if (version[k] != '.' && (version[k] < '0' || version[k] > '9')) break;
+        running[k] = version[k];
+    }
+    if (std::strcmp(built, running) != 0) {
         char text[200];
         PyOS_snprintf(text, sizeof text,
                       "compiletime version %s of module '%.100s' does not match runtime version %s",
@@ -82,14 +89,18 @@ void moduleBody(PyObject* dict) {
     bindUtilities(dict);
 }
 
-void initialize() {
+// Makes and fills the module. On 3.x `owner` takes the reference the init
+// function returns; it is the caller's so that on failure the namespace
+// outlives the traceback entry that names it.
+void initialize(py::Ref& owner) {
     checkVersion();
-    PyObject* module = Py_InitModule4("scopebodycache", nullptr, kModuleDoc, nullptr, PYTHON_API_VERSION);
-    if (module == nullptr) py::fail();
+    PyObject* module = compat::createModule(gModuleDef, owner);
     PyObject* dict = PyModule_GetDict(module);
     gModuleDict = dict;
-    py::Ref builtinModule = py::check(PyImport_AddModule("__builtin__")).copy();
+    py::Ref builtinModule = py::check(PyImport_AddModule(compat::kBuiltinsModule)).copy();
     py::checkStatus(PyDict_SetItemString(dict, "__builtins__", builtinModule.get()));
+    compat::setPackage(dict, "pysource");
+    compat::readOptimizeFlag();
 
     internNames();
     internStepNames();
@@ -115,29 +126,22 @@ void initialize() {
 }
 
 // A traceback entry naming the init function, as for a Python frame.
-void addInitTraceback() {
-    PyObject *type, *value, *tb;
-    PyErr_Fetch(&type, &value, &tb);
-    PyCodeObject* code = PyCode_NewEmpty(kModuleName, kInitContext, 0);
-    PyFrameObject* frame = nullptr;
-    if (code != nullptr) frame = PyFrame_New(PyThreadState_Get(), code, gModuleDict ? gModuleDict : PyEval_GetGlobals(), nullptr);
-    PyErr_Restore(type, value, tb);
-    if (frame != nullptr) {
-        frame->f_lineno = 0;
-        PyTraceBack_Here(frame);
-    }
-    Py_XDECREF(code);
-    Py_XDECREF(frame);
+void addInitTraceback() noexcept {
+    PyObject* globals = gModuleDict ? gModuleDict : PyEval_GetGlobals();
+    compat::addTracebackEntry(kModuleName, kInitContext, globals);
 }
 
 }  // namespace
 }  // namespace sbc
 
-PY_MODULE_INIT initscopebodycache() {
+SBC_MODULE_INIT(scopebodycache) {
+    py::Ref module;
     try {
-        sbc::initialize();
+        sbc::initialize(module);
     } catch (...) {
         py::setErrorFromCurrentException();
         sbc::addInitTraceback();
+        module.reset();
     }
+    return compat::initResult(module.release());
 }

@@ -1,5 +1,6 @@
 #include "pysource/scopebodycache/names.hpp"
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 
 namespace sbc {
@@ -7,7 +8,7 @@ namespace sbc {
 Names gNames;
 
 namespace {
-PyObject* intern(const char* text) { return py::check(PyString_InternFromString(text)).release(); }
+PyObject* intern(const char* text) { return py::check(compat::internStr(text)).release(); }
 }  // namespace
 
 void internNames() {

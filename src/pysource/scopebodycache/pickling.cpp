@@ -132,7 +132,7 @@ py::Ref reduce(const PickledClass& c, PyObject* self) {
             break;
         }
         case FieldKind::Index:
-            fields[i] = py::check(PyInt_FromSsize_t(indexAt(c, f, self)));
+            fields[i] = py::check(compat::intFromSsize(indexAt(c, f, self)));
             break;
         }
     }
@@ -144,7 +144,7 @@ py::Ref reduce(const PickledClass& c, PyObject* self) {
     const bool setstateForm = size > c.fieldCount || anyObjectSet;
 
     py::Ref rebuild = py::Ref::own(lookupGlobal(gNames.*c.rebuildName));
-    py::Ref checksum = py::check(PyInt_FromLong(c.checksum));
+    py::Ref checksum = py::check(compat::intFromLong(c.checksum));
     PyObject* type = reinterpret_cast<PyObject*>(Py_TYPE(self));
     if (setstateForm) {
         py::Ref args = py::check(PyTuple_Pack(3, type, checksum.get(), Py_None));
@@ -194,7 +194,7 @@ py::Ref rebuild(const PickledClass& c, PyObject* type, PyObject* checksumArg, Py
     if (checksum != c.checksum) {
         py::Ref pickle = py::check(PyImport_ImportModule("pickle"));
         py::Ref pickleError = py::check(PyObject_GetAttrString(pickle.get(), "PickleError"));
-        py::Ref message = py::check(PyString_FromFormat(c.checksumMessage, checksum));
+        py::Ref message = py::check(compat::strFromFormat(c.checksumMessage, checksum));
         PyErr_SetObject(pickleError.get(), message.get());
         py::fail();
     }
@@ -268,8 +268,12 @@ bool inheritsFromObject(PyTypeObject* type, const char* name) {
 
 void install(PyTypeObject* type) {
     PyObject* typeObject = reinterpret_cast<PyObject*>(type);
-    // A class with hooks of its own keeps them.
-    if (PyObject_HasAttrString(typeObject, "__getstate__")) return;
+    // A class with hooks of its own keeps them (3.11 on, every class has
+    // object's __getstate__, which does not count).
+    if (PyObject_HasAttrString(typeObject, "__getstate__") &&
+        !(compat::kObjectHasGetstate && inheritsFromObject(type, "__getstate__"))) {
+        return;
+    }
     if (!inheritsFromObject(type, "__reduce_ex__") || !inheritsFromObject(type, "__reduce__")) return;
     const ClassFunctions& f = functionsFor(type);
     py::Ref reduceMethod = newMethod(f.reduce, type, kModuleName);

@@ -124,7 +124,7 @@ void bindDestroyableBase() {
 void checkOtherTypes() {
     using contracts::PlainSiblingObject;
     using contracts::VtabSiblingObject;
-    importType("__builtin__", "type", sizeof(PyHeapTypeObject), false);
+    importType(compat::kBuiltinsModule, "type", sizeof(PyHeapTypeObject), false);
     importType(kFastaccess, "CLogger", sizeof(PlainSiblingObject), false);
     importType(kFastaccess, "CBytesTokenizer", sizeof(VtabSiblingObject), true);
     importType(kSymbolinfo, "CSingleResolvedInfo", sizeof(VtabSiblingObject), true);
@@ -229,29 +229,19 @@ void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo) {
 }
 
 // --- Watching names ----------------------------------------------------------
-// A 2.7 dict keeps its entries in one table (ma_table); a name stays in its
-// entry until the table is rebuilt. While ma_table is the table the entry
-// was found in, that entry is live memory, and if it still holds the very
-// key and value, the name maps to that value (a key has one entry).
 
 void WatchedName::watch(PyObject* dict, PyObject* name, PyObject* expected) noexcept {
     dict_ = dict;
     name_ = name;
     expected_ = expected;
-    table_ = entry_ = nullptr;
+    since_.watch(dict);
 }
 
 bool WatchedName::holds() noexcept {
     if (dict_ == nullptr || expected_ == nullptr) return false;
-    auto* d = reinterpret_cast<PyDictObject*>(dict_);
-    if (table_ == d->ma_table) {
-        auto* e = static_cast<PyDictEntry*>(entry_);
-        if (e->me_key == name_ && e->me_value == expected_) return true;
-    }
+    if (since_.unchanged(dict_, name_, expected_)) return true;
     if (PyDict_GetItem(dict_, name_) != expected_) return false;
-    // Found where the dict's own lookup puts it; remembered for next time.
-    table_ = d->ma_table;
-    entry_ = d->ma_lookup(d, name_, reinterpret_cast<PyStringObject*>(name_)->ob_shash);
+    since_.mark(dict_, name_);
     return true;
 }
 
@@ -270,7 +260,7 @@ PyObject* lookupGlobal(PyObject* name) {
     PyObject* v = PyDict_GetItem(gModuleDict, name);
     if (v == nullptr) v = PyDict_GetItem(PyEval_GetBuiltins(), name);
     if (v == nullptr) {
-        PyErr_Format(PyExc_NameError, msg::kNameNotDefined, PyString_AS_STRING(name));
+        PyErr_Format(PyExc_NameError, msg::kNameNotDefined, compat::strText(name));
         py::fail();
     }
     return v;
@@ -305,7 +295,7 @@ Py_ssize_t indexForLineno(PyObject* logicalList, long lineno, bool native) {
         return i;
     }
     py::Ref fn = siblingFunction(gNames.fastaccess, gNames.IndexForLineno);
-    py::Ref line = py::check(PyInt_FromLong(lineno));
+    py::Ref line = py::check(compat::intFromLong(lineno));
     py::Ref r = py::check(PyObject_CallFunctionObjArgs(fn.get(), logicalList, line.get(), nullptr));
     return py::asIndex(r.get());
 }

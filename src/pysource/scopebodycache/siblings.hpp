@@ -2,6 +2,7 @@
 // points, bound once, and the module globals looked up at each use.
 #pragma once
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 #include "pysource/contracts/capi.hpp"
 #include "pysource/contracts/destroyable_base.hpp"
@@ -67,8 +68,8 @@ void bindNativeSiblings(PyObject* fastaccess, PyObject* symbolinfo);
 bool nativeSiblingsCurrent() noexcept;
 
 // One name of a dict, watched for still holding an expected object. Asked at
-// every FindChanges call, so it remembers where the name's entry was and
-// only looks the name up again when the dict has moved its entries.
+// every FindChanges call, so it looks the name up again only when the dict
+// may have changed since the last lookup (compat::DictWatch says).
 class WatchedName {
 public:
     WatchedName() noexcept = default;
@@ -79,8 +80,7 @@ private:
     PyObject* dict_ = nullptr;      // borrowed: module dicts live as long as the process here
     PyObject* name_ = nullptr;      // an interned str
     PyObject* expected_ = nullptr;  // borrowed from what keeps it (the import-time snapshot)
-    void* table_ = nullptr;         // the dict's entry table when the entry was found
-    void* entry_ = nullptr;
+    compat::DictWatch since_;       // marked at the last lookup that found expected_
 };
 
 // Calls of the siblings' Python-level functions, looked up by name through

@@ -27,10 +27,11 @@ double getNowTime() noexcept {
 char getInfoBytesKind(PyObject* ibytes) noexcept {
     return neverRaises("pysource.symbolinfo.GetInfoBytesKind", char(0), [ibytes] {
         if (ibytes == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
-        if (PyString_GET_SIZE(ibytes) < 2 || PyString_AS_STRING(ibytes)[0] != ':') {
+        // By characters: a kind read from a 2.7 pickle (latin-1) is the same.
+        if (compat::strLength(ibytes) < 2 || compat::strCharAt(ibytes, 0) != ':') {
             return gSymbolInfo.kPlainEquivKind;
         }
-        return PyString_AS_STRING(ibytes)[1];
+        return compat::strCharAt(ibytes, 1);
     });
 }
 
@@ -111,8 +112,8 @@ PyObject* py_ULongLongValueForDoubleBits(PyObject*, PyObject* const* a) {
 PyObject* py_DoubleValueForULongLongBits(PyObject*, PyObject* const* a) {
     PyObject* o = a[0];
     unsigned long long bits;
-    if (PyInt_Check(o)) {
-        const long v = PyInt_AS_LONG(o);
+    if (compat::isMachineInt(o)) {
+        const long v = compat::machineIntValue(o);
         if (v < 0) msg::raise(PyExc_OverflowError, msg::kNegativeToUnsigned);
         bits = static_cast<unsigned long long>(v);
     } else if (PyLong_Check(o)) {
@@ -136,14 +137,14 @@ PyObject* py_DoubleValueForPyIntBits(PyObject*, PyObject* const* a) {
 }
 
 PyObject* py_IsDefKind(PyObject*, PyObject* const* a) {
-    const long v = PyInt_AsLong(a[0]);
+    const long v = compat::intAsLong(a[0]);
     if (v == -1 && PyErr_Occurred()) py::fail();
     if (v < -128 || v > 127) msg::raise(PyExc_OverflowError, "value too large to convert to char");
     return boolResult(isDefKind(static_cast<char>(v)));
 }
 
 PyObject* py_GetInfoBytesKind(PyObject*, PyObject* const* a) {
-    return py::check(PyInt_FromLong(static_cast<signed char>(getInfoBytesKind(a[0])))).release();
+    return py::check(compat::intFromLong(static_cast<signed char>(getInfoBytesKind(a[0])))).release();
 }
 
 constexpr Param kLogical{"logical", ArgCheck::Any};

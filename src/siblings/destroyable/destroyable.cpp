@@ -6,6 +6,7 @@
 // table's entry reaches _destroy_impl by attribute lookup: an override in any
 // subclass, native or Python, runs exactly once.
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 #include "pysource/contracts/capi.hpp"
 #include "pysource/contracts/destroyable_base.hpp"
@@ -169,11 +170,14 @@ void publishObject(PyObject* module, PyObject* capi, const char* name, PyObject*
     siblings::setAttr(module, name, value);
 }
 
-void init() {
-    PyObject* module = Py_InitModule3("destroyable", nullptr,
-                                      "Objects with an explicit end of life.");
-    if (module == nullptr) py::fail();
-    gDestroyImplName = PyString_InternFromString("_destroy_impl");
+compat::ModuleDef gModuleDef = SBC_MODULE_DEF("destroyable", "Objects with an explicit end of life.", nullptr);
+
+// The module, made and filled; on 3.x the reference the init function
+// returns.
+py::Ref init() {
+    py::Ref owner;
+    PyObject* module = compat::createModule(gModuleDef, owner);
+    gDestroyImplName = compat::internStr("_destroy_impl");
     if (gDestroyImplName == nullptr) py::fail();
     readyDestroyableType(module);
     siblings::readyMinimalType(module, "_CHandlerRecord", &gHandlerRecordType,
@@ -191,13 +195,12 @@ void init() {
     siblings::publish(capi, "_gLogAllEmissions", &gLogAllEmissions, contracts::sig::kInt);
     siblings::publish(capi, "_gTriedToImportQObject", &gTriedToImportQObject,
                       contracts::sig::kInt);
+    return owner;
 }
 
 }  // namespace destroyable
 
-PY_MODULE_INIT initdestroyable() {
-    py::guarded([]() -> PyObject* {
-        destroyable::init();
-        return Py_None;
-    });
+SBC_MODULE_INIT(destroyable) {
+    PyObject* module = py::guarded([] { return destroyable::init().release(); });
+    return compat::initResult(module);
 }

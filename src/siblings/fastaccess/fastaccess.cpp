@@ -5,6 +5,7 @@
 // binary-search it. Neither runs Python code while it walks the list (it only
 // reads fields of the records), so borrowed items stay valid throughout.
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 #include "pysource/contracts/capi.hpp"
 #include "pysource/contracts/logical_record.hpp"
@@ -47,8 +48,8 @@ long long toInteger(PyObject* value, const char* field, long long lo, long long 
         py::fail();
     }
     long long v;
-    if (PyInt_Check(value)) {
-        v = PyInt_AS_LONG(value);
+    if (compat::isMachineInt(value)) {
+        v = compat::machineIntValue(value);
     } else if (PyLong_Check(value)) {
         int overflow = 0;
         v = PyLong_AsLongLongAndOverflow(value, &overflow);
@@ -80,7 +81,7 @@ void releaseTokens(PyObject** tokens, Py_ssize_t count) {
 // Replaces the token array. The old tokens are released after the record is
 // consistent again, since a str subclass's destructor may look at it.
 void setTokens(LogicalLineObject* self, PyObject* tokens) {
-    if (PyString_Check(tokens) || PyUnicode_Check(tokens)) {
+    if (compat::isStr(tokens) || compat::isOtherText(tokens)) {
         PyErr_SetString(PyExc_TypeError, "tokens must be a sequence of str, not a string");
         py::fail();
     }
@@ -88,7 +89,7 @@ void setTokens(LogicalLineObject* self, PyObject* tokens) {
     Py_ssize_t n = PySequence_Fast_GET_SIZE(seq.get());
     PyObject** items = PySequence_Fast_ITEMS(seq.get());
     for (Py_ssize_t i = 0; i < n; ++i) {
-        if (!PyString_Check(items[i])) {
+        if (!compat::isStr(items[i])) {
             PyErr_Format(PyExc_TypeError, "tokens must be str, not %.200s",
                          Py_TYPE(items[i])->tp_name);
             py::fail();
@@ -169,7 +170,8 @@ void appendRepr(std::string& out, PyObject* o) {
         return;
     }
     py::Ref r = py::check(PyObject_Repr(o));
-    out.append(PyString_AS_STRING(r.get()), PyString_GET_SIZE(r.get()));
+    const std::string_view text = compat::strView(r.get());
+    out.append(text.data(), text.size());
 }
 
 PyObject* logicalRepr(PyObject* self) {
@@ -191,7 +193,7 @@ PyObject* logicalRepr(PyObject* self) {
         out += " local ";
         appendRepr(out, local.get());
         out += ">";
-        return PyString_FromStringAndSize(out.data(), static_cast<Py_ssize_t>(out.size()));
+        return compat::strFromBytes(out.data(), static_cast<Py_ssize_t>(out.size()));
     });
 }
 
@@ -210,12 +212,12 @@ PyObject* getTokens(PyObject* self, void*) {
 }
 
 PyObject* getTokenCount(PyObject* self, void*) {
-    return PyInt_FromSsize_t(asLogical(self)->fTokenCount);
+    return compat::intFromSsize(asLogical(self)->fTokenCount);
 }
 
 template <class T, T LogicalLineObject::*Field>
 PyObject* getInteger(PyObject* self, void*) {
-    return PyInt_FromLong(asLogical(self)->*Field);
+    return compat::intFromLong(asLogical(self)->*Field);
 }
 
 // The closure is the field's Python name, for messages.
@@ -421,7 +423,7 @@ PyObject* FindIndexOfLogical(PyObject*, PyObject* args) {
         PyObject *list, *logical;
         if (!PyArg_ParseTuple(args, "OO:FindIndexOfLogical", &list, &logical)) py::fail();
         requireList(list, "FindIndexOfLogical");
-        return PyInt_FromSsize_t(findIndex(list, logical));
+        return compat::intFromSsize(findIndex(list, logical));
     });
 }
 
@@ -437,7 +439,7 @@ PyObject* IndexForLineno(PyObject*, PyObject* args) {
             PyErr_SetString(PyExc_TypeError, "Argument must be a logical");
             py::fail();
         }
-        return PyInt_FromSsize_t(i);
+        return compat::intFromSsize(i);
     });
 }
 
@@ -470,10 +472,13 @@ void readyLogicalType(PyObject* module) {
     siblings::readyType(module, "LogicalLineType", &t);
 }
 
-void init() {
-    PyObject* module = Py_InitModule3("_fastaccess", gModuleMethods,
-                                      "Logical-line records and lookups over them.");
-    if (module == nullptr) py::fail();
+compat::ModuleDef gModuleDef = SBC_MODULE_DEF("_fastaccess", "Logical-line records and lookups over them.", gModuleMethods);
+
+// The module, made and filled; on 3.x the reference the init function
+// returns.
+py::Ref init() {
+    py::Ref owner;
+    PyObject* module = compat::createModule(gModuleDef, owner);
     readyLogicalType(module);
     siblings::readyMinimalType(module, "CLogger", &gCLoggerType, "pysource._fastaccess.CLogger");
     siblings::readyMinimalType(module, "CBytesTokenizer", &gCBytesTokenizerType,
@@ -495,13 +500,12 @@ void init() {
                       contracts::sig::kIndexForLineno);
     siblings::publish(capi, "FindIndexOfLogical", reinterpret_cast<void*>(findIndexOfLogical),
                       contracts::sig::kFindIndexOfLogical);
+    return owner;
 }
 
 }  // namespace fastaccess
 
-PY_MODULE_INIT init_fastaccess() {
-    py::guarded([]() -> PyObject* {
-        fastaccess::init();
-        return Py_None;
-    });
+SBC_MODULE_INIT(_fastaccess) {
+    PyObject* module = py::guarded([] { return fastaccess::init().release(); });
+    return compat::initResult(module);
 }

@@ -7,6 +7,7 @@
 // results directly and never call into Python code. They take str only (a
 // TypeError otherwise); LeafScopeNameHasIndex answers False for a non-str.
 
+#include "common/pycompat.hpp"
 #include "common/pyref.hpp"
 #include "pysource/contracts/capi.hpp"
 #include "siblings/sibling_util.hpp"
@@ -91,7 +92,7 @@ public:
 
     // `*slot` keeps the interned str for the life of the process.
     void object(const char* name, PyObject** slot, const char* value) {
-        PyObject* s = PyString_InternFromString(value);
+        PyObject* s = compat::internStr(value);
         if (s == nullptr) py::fail();
         *slot = s;
         siblings::publish(capi_, name, slot, sig::kObject);
@@ -101,14 +102,14 @@ public:
     void kind(const char* name, char* slot, char value) {
         *slot = value;
         siblings::publish(capi_, name, slot, sig::kChar);
-        py::Ref n = py::check(PyInt_FromLong(static_cast<unsigned char>(value)));
+        py::Ref n = py::check(compat::intFromLong(static_cast<unsigned char>(value)));
         siblings::setAttr(module_, name, n.get());
     }
 
     void size(const char* name, Py_ssize_t* slot, Py_ssize_t value) {
         *slot = value;
         siblings::publish(capi_, name, slot, sig::kSsize);
-        py::Ref n = py::check(PyInt_FromSsize_t(value));
+        py::Ref n = py::check(compat::intFromSsize(value));
         siblings::setAttr(module_, name, n.get());
     }
 
@@ -146,28 +147,19 @@ void publishConstants(Publisher& p) {
 // Scope-name helpers.
 
 void requireStr(PyObject* o, const char* what) {
-    if (!PyString_Check(o)) {
+    if (!compat::isStr(o)) {
         PyErr_Format(PyExc_TypeError, "%s must be str, not %.200s", what, Py_TYPE(o)->tp_name);
         py::fail();
     }
 }
 
-std::string_view view(PyObject* s) {
-    return {PyString_AS_STRING(s), static_cast<size_t>(PyString_GET_SIZE(s))};
-}
+// The bytes of a str (UTF-8 on 3.x); throws when it has none.
+std::string_view view(PyObject* s) { return compat::strView(s); }
 
 // Concatenates pieces into one new str with a single allocation.
 template <size_t N>
 py::Ref concat(const std::string_view (&parts)[N]) {
-    Py_ssize_t size = 0;
-    for (const std::string_view& part : parts) size += static_cast<Py_ssize_t>(part.size());
-    py::Ref result = py::check(PyString_FromStringAndSize(nullptr, size));
-    char* out = PyString_AS_STRING(result.get());
-    for (const std::string_view& part : parts) {
-        if (!part.empty()) std::memcpy(out, part.data(), part.size());
-        out += part.size();
-    }
-    return result;
+    return py::check(compat::strConcat(parts));
 }
 
 // Length of the "#<digits>" suffix at the end of `name`, or 0 if it has none.
@@ -184,7 +176,7 @@ PyObject* JoinTwoScopeNames(PyObject* scope, PyObject* name, int /*skip*/) noexc
     return py::guarded([&] {
         requireStr(scope, "scope");
         requireStr(name, "name");
-        if (PyString_GET_SIZE(scope) == 0) return py::Ref::own(name).release();
+        if (view(scope).empty()) return py::Ref::own(name).release();
         return concat({view(scope), std::string_view(&kDot, 1), view(name)}).release();
     });
 }
@@ -202,7 +194,7 @@ PyObject* SplitScopeNames(PyObject* full, int /*skip*/) noexcept {
         for (Py_ssize_t i = 0; i < count; ++i) {
             size_t end = text.find(kDot, start);
             if (end == std::string_view::npos) end = text.size();
-            PyObject* part = PyString_FromStringAndSize(text.data() + start,
+            PyObject* part = compat::strFromBytes(text.data() + start,
                                                         static_cast<Py_ssize_t>(end - start));
             if (part == nullptr) py::fail();
             PyList_SET_ITEM(parts.get(), i, part);
@@ -220,14 +212,13 @@ PyObject* SplitScopeNameFromSuffixes(PyObject* name, int /*skip*/) noexcept {
         py::Ref bare, index;
         if (suffix == 0) {
             bare = py::Ref::own(name);
-            index = py::check(PyInt_FromLong(-1));
+            index = py::check(compat::intFromLong(-1));
         } else {
             size_t bareLength = text.size() - suffix;
             bare = py::check(
-                PyString_FromStringAndSize(text.data(), static_cast<Py_ssize_t>(bareLength)));
+                compat::strFromBytes(text.data(), static_cast<Py_ssize_t>(bareLength)));
             // The digits run to the str's terminating NUL; a long suffix gives a long.
-            index = py::check(
-                PyInt_FromString(const_cast<char*>(text.data()) + bareLength + 1, nullptr, 10));
+            index = py::check(compat::intFromDigits(text.data() + bareLength + 1));
         }
         PyObject* result = PyTuple_New(2);
         if (result == nullptr) py::fail();
@@ -245,9 +236,9 @@ PyObject* AppendScopeSuffixes(PyObject* name, PyObject* index, PyObject* extra,
         char digits[32];
         py::Ref longText;  // keeps a long's digits alive
         std::string_view indexText;
-        if (PyInt_Check(index)) {
+        long value;
+        if (compat::smallIntOf(index, &value)) {
             // Runs once per definition named: formatted by hand.
-            const long value = PyInt_AS_LONG(index);
             unsigned long magnitude = value < 0 ? 0UL - static_cast<unsigned long>(value)
                                                 : static_cast<unsigned long>(value);
             char* end = digits + sizeof digits;
@@ -299,8 +290,15 @@ PyObject* pyAppendScopeSuffixes(PyObject*, PyObject* args) {
     return AppendScopeSuffixes(name, index, extra, 0);
 }
 
+// The bytes of a name for the native forms, which cannot raise: false for
+// anything but a str with bytes (UTF-8) to read.
+bool nameBytes(PyObject* name, std::string_view* out) noexcept {
+    return compat::isStr(name) && compat::tryStrView(name, out);
+}
+
 int nativeLeafScopeNameHasIndex(PyObject* name) noexcept {
-    return PyString_Check(name) && suffixLength(view(name)) != 0;
+    std::string_view text;
+    return nameBytes(name, &text) && suffixLength(text) != 0;
 }
 
 PyObject* LeafScopeNameHasIndex(PyObject*, PyObject* name) {
@@ -308,17 +306,18 @@ PyObject* LeafScopeNameHasIndex(PyObject*, PyObject* name) {
 }
 
 Py_ssize_t nativeScopeNameParentLength(PyObject* full) noexcept {
-    if (!PyString_Check(full)) return -2;
-    const size_t dot = view(full).rfind(kDot);
+    std::string_view text;
+    if (!nameBytes(full, &text)) return -2;
+    const size_t dot = text.rfind(kDot);
     return dot == std::string_view::npos ? -1 : static_cast<Py_ssize_t>(dot);
 }
 
 Py_ssize_t nativeScopeNameSuffix(PyObject* name, Py_ssize_t* bareLength) noexcept {
-    if (!PyString_Check(name)) {
+    std::string_view text;
+    if (!nameBytes(name, &text)) {
         *bareLength = 0;
         return -1;
     }
-    const std::string_view text = view(name);
     const size_t suffix = suffixLength(text);
     *bareLength = static_cast<Py_ssize_t>(text.size() - suffix);
     if (suffix == 0) return -1;
@@ -377,10 +376,13 @@ void publishFunctions(PyObject* capi) {
                       sig::kScopeNameParentLength);
 }
 
-void init() {
-    PyObject* module = Py_InitModule3("symbolinfo", gModuleMethods,
-                                      "Scope-name helpers and symbol kind constants.");
-    if (module == nullptr) py::fail();
+compat::ModuleDef gModuleDef = SBC_MODULE_DEF("symbolinfo", "Scope-name helpers and symbol kind constants.", gModuleMethods);
+
+// The module, made and filled; on 3.x the reference the init function
+// returns.
+py::Ref init() {
+    py::Ref owner;
+    PyObject* module = compat::createModule(gModuleDef, owner);
     PyObject* capi = siblings::makeCapi(module);
     Publisher publisher(module, capi);
     publishConstants(publisher);
@@ -394,13 +396,12 @@ void init() {
                                "pysource.symbolinfo.CFullyScopedName");
     siblings::readyMinimalType(module, "CDefInfo", &gCDefInfoType,
                                "pysource.symbolinfo.CDefInfo");
+    return owner;
 }
 
 }  // namespace symbolinfo
 
-PY_MODULE_INIT initsymbolinfo() {
-    py::guarded([]() -> PyObject* {
-        symbolinfo::init();
-        return Py_None;
-    });
+SBC_MODULE_INIT(symbolinfo) {
+    PyObject* module = py::guarded([] { return symbolinfo::init().release(); });
+    return compat::initResult(module);
 }
