@@ -6,7 +6,6 @@
 #include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
-#include <string_view>
 #include <vector>
 
 namespace sbc::finder {
@@ -57,12 +56,6 @@ bool nameDefinitionNative(PyObject* self, const LogicalRef& logical, Py_ssize_t 
     return true;
 }
 
-bool sameExactStr(PyObject* a, PyObject* b) noexcept {
-    std::string_view x, y;
-    return compat::isStrExact(a) && compat::isStrExact(b) && compat::tryStrView(a, &x) &&
-           compat::tryStrView(b, &y) && x == y;
-}
-
 // The native pass over a stretch of plain lines (the bulk of a file): the
 // loop's own work and _SetLogicalScopeNames, on borrowed records, since
 // nothing here runs Python code but the release of an old name a store
@@ -85,7 +78,7 @@ Py_ssize_t NamePlainLinesNative(PyObject* self, Py_ssize_t i, std::vector<OpenSc
             if (old == Py_None || !strEquals(old, top)) {
                 requireStrOrNone(top);
                 setScopeName(l, top);
-            } else if (sameExactStr(old, top)) {
+            } else if (compat::isStrExact(old) && compat::isStrExact(top) && compat::strEqual(old, top)) {
                 // Over a named list the rest of this body then compares
                 // by identity.
                 stack.back().name = py::Ref::own(old);
