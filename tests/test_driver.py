@@ -1,6 +1,8 @@
 """CChangeFinder's life cycle and the FindChanges driver: strategy, result, guard, exits."""
 
+import gc
 import unittest
+import weakref
 
 from pysource.scopebodycache import CChangeFinder
 
@@ -61,6 +63,10 @@ class Recorder(CChangeFinder):
         self.seen += [added_list, indicies_to_check]
         if indicies_to_check is not None:  # the built-in step would fail on None
             CChangeFinder._ProcessAddedLogicals(self, added_list, indicies_to_check)
+
+
+class Box(object):
+    pass
 
 
 class DriverTest(unittest.TestCase):
@@ -152,6 +158,49 @@ class DriverTest(unittest.TestCase):
         finder.removed_result = None
         finder.FindChanges([], [])
         self.assertEqual(finder.seen[2:], [[], None])
+
+    def testResultsStayTheCallers(self):
+        # A call may reuse the sets of a result its caller has dropped, never
+        # ones the caller still reaches, watches or filled with its own objects.
+        lst = Read(kSampleSource)
+        finder = CChangeFinder(lst)
+        finder.FindChanges(lst, [])
+        typed, back = kSampleSource.replace('x = 1', 'x = 3'), kSampleSource
+
+        def Type(source, finder=finder, lst=lst):
+            return finder.FindChanges(*Edit(lst, source))
+        kept = Type(typed)
+        self.assertIsNot(Type(back), kept)
+        contents = Type(typed)[0]
+        watched = weakref.ref(Type(typed)[0])
+        self.assertIsNot(Type(back)[0], watched())
+        self.assertIsNone(watched())
+
+        class Noted(object):
+            freed = []
+
+            def __init__(self, ref=None):
+                self.ref = ref
+
+            def __del__(self):
+                Noted.freed.append(1)
+        Type(back)[1].add(Noted())
+        self.assertEqual(Noted.freed, [])
+        for source in [typed, back] * 3:
+            result = Type(source)
+            self.assertEqual(result, (set(['A#0.f#1']), set(), set()))
+        self.assertEqual(Noted.freed, [1])
+        self.assertEqual((kept, contents), ((set(['A#0.f#1']), set(), set()), set(['A#0.f#1'])))
+        self.assertIsNot(result[0], contents)
+        # A set that refers back to its finder does not keep the two alive.
+        del result
+        box = Box()
+        box.finder = finder
+        Type(typed)[0].add(box)
+        probe = weakref.ref(box)
+        del finder, lst, Type, box
+        gc.collect()
+        self.assertIsNone(probe())
 
     def testStateAfterEachKindOfExit(self):
         done = ['prepare', 'removed', 'whole', 'clear']

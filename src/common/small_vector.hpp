@@ -51,7 +51,7 @@ public:
     }
 
 private:
-    T inline_[N] = {};
+    T inline_[N];  // items past size_ are never read: left as they come
     size_t size_ = 0;
     bool onHeap_ = false;
     std::vector<T> heap_;

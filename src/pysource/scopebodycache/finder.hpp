@@ -44,7 +44,10 @@
 //    dicts, ==), and the `startswith` of a name that is not a str;
 // 6. the release of an old name in storeSlot (the object may have a
 //    finalizer), and any allocation of a container, which may start a
-//    garbage collection that runs finalizers.
+//    garbage collection that runs finalizers;
+// 7. after the pass, the release of a spare result tuple whose sets the
+//    caller still held or filled (their finalizers), when the finder is
+//    idle again.
 // After each of them the pass re-checks instead of trusting what it read
 // before: list items are read by index against the live length (logicalAt
 // raises IndexError past the end) and held as LogicalRef across the call;
@@ -94,8 +97,12 @@ struct FinderState {
     long owedScanIndent;
     // - the native pass of the call in progress (null otherwise);
     NativePass* native;
-    // - the definition index, kept between calls while it matches the list.
+    // - the definition index, kept between calls while it matches the list;
     DefIndex* defIndex;
+    // - the tuple the last native call returned, with its three sets, while
+    //   they are small: the next call uses them again once the caller has
+    //   let go of all four (null when none is kept).
+    PyObject* spareResult;
 
     // Each object field, for the slots (allocation, gc, deallocation).
     template <class Visit>
@@ -247,6 +254,9 @@ void PropagateScopeIndexChangeForward(PyObject* self, PyObject* oldScopeName,
                                       PyObject* newScopeName, Py_ssize_t start, Py_ssize_t end);
 Py_ssize_t FindScopeIndexForLogical(PyObject* self, PyObject* logical, Py_ssize_t i);
 py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i);
+// The same; in the native pass `likely`, when it is the name found, is
+// answered without building that name again (a line's old scope, say).
+py::Ref findScopeNameContaining(PyObject* self, Py_ssize_t i, PyObject* likely);
 
 // Internal steps, not visible to Python.
 // _ProcessDedentedComments in two halves: where the run from `first` ends

@@ -158,7 +158,7 @@ bool ProcessTypedLine(PyObject* self, PyObject* addedList, PyObject* removedList
     setLocalScopeDefined(a, nullptr);
     s.lastProcessedIndex = -1;
     s.nextChangeIndex = n;
-    py::Ref scope = FindScopeNameContainingLogical(self, i);
+    py::Ref scope = findScopeNameContaining(self, i, removedScope);
     requireScopeFound(scope.get(), i);
     requireStrOrNone(scope.get());
     setScopeName(a, scope.get());

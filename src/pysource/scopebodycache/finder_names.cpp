@@ -8,13 +8,39 @@
 #include "pysource/scopebodycache/route.hpp"
 #include "pysource/scopebodycache/siblings.hpp"
 
+#include <string_view>
+
 namespace sbc {
 
 using namespace contracts;
 
 namespace finder {
 
+namespace {
+
+// Whether `name` is the full name of the class/def `def` (its scope joined
+// with its local name, as GetFullNameForScopeDef makes it): false when any
+// of them is not a str.
+bool isFullNameOf(PyObject* name, const Logical* def) noexcept {
+    PyObject* scope = def->fScopeName;
+    PyObject* local = localScopeDefined(def);
+    std::string_view n, s, l;
+    if (!compat::isStrExact(name) || !compat::isStrExact(scope) || !compat::isStrExact(local) ||
+        !compat::tryStrView(name, &n) || !compat::tryStrView(scope, &s) || !compat::tryStrView(local, &l)) {
+        return false;
+    }
+    if (s.empty()) return n == l;
+    return n.size() == s.size() + 1 + l.size() && n.compare(0, s.size(), s) == 0 && n[s.size()] == '.' &&
+           n.compare(s.size() + 1, l.size(), l) == 0;
+}
+
+}  // namespace
+
 py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i) {
+    return findScopeNameContaining(self, i, nullptr);
+}
+
+py::Ref findScopeNameContaining(PyObject* self, Py_ssize_t i, PyObject* likely) {
     FinderState& s = finderState(self);
     assertThat(i < s.nextChangeIndex);
     LogicalRef logical = logicalAt(self, i);
@@ -39,6 +65,7 @@ py::Ref FindScopeNameContainingLogical(PyObject* self, Py_ssize_t i) {
     // A class/def line without a name opens no scope: its body stays in
     // the enclosing scope, as the whole-list pass has it.
     if (indent > anchor->fIndent && isScopeStart(anchor) && localScopeDefined(anchor) != nullptr) {
+        if (likely != nullptr && nativePass(self) && isFullNameOf(likely, anchor)) return py::Ref::own(likely);
         return callGetFullNameForScopeDef(reinterpret_cast<PyObject*>(anchor), nativePass(self));
     }
     return py::Ref::own(anchor->fScopeName);

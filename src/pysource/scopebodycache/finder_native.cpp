@@ -17,6 +17,7 @@ void traceDefinitionIndex(const char* event) noexcept {
 }
 
 int FinderState::traverseInternal(visitproc visit, void* arg) const {
+    Py_VISIT(spareResult);
     return defIndex != nullptr ? defIndex->traverse(visit, arg) : 0;
 }
 
@@ -24,6 +25,7 @@ void FinderState::clearInternal() noexcept {
     DefIndex* index = defIndex;
     defIndex = nullptr;
     delete index;
+    Py_CLEAR(spareResult);
 }
 
 void dropDefinitionIndex(PyObject* self) noexcept {
@@ -39,7 +41,9 @@ void dropDefinitionIndex(PyObject* self) noexcept {
         s.defIndex = nullptr;
         return;
     }
-    s.clearInternal();
+    DefIndex* index = s.defIndex;
+    s.defIndex = nullptr;
+    delete index;
 }
 
 DefIndex* definitionIndex(PyObject* self) {
