@@ -404,7 +404,7 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
 // tuple and its three sets are those of the last call, once the caller has
 // dropped them); typing a character, 0.25-0.33 us at any file size (more
 // when a blank or comment line follows it); a method header in or out,
-// about 0.85 us; a header that renumbers a later namesake and renames its
+// about 0.9 us; a header that renumbers a later namesake and renames its
 // body, about 1.7 us; the whole-list pass, 57-87 ns per fresh logical and
 // 45-47 ns per named one. On an override's route typing costs 1.6-3 us,
 // and a definition edit walks the scopes-seen table over the whole list
