@@ -10,6 +10,11 @@
 template <class T, size_t N>
 class SmallVector {
 public:
+    SmallVector() = default;
+    // Unset inline slots must not be copied.
+    SmallVector(const SmallVector&) = delete;
+    SmallVector& operator=(const SmallVector&) = delete;
+
     size_t size() const noexcept { return onHeap_ ? heap_.size() : size_; }
     bool empty() const noexcept { return size() == 0; }
     T* begin() noexcept { return onHeap_ ? heap_.data() : inline_; }
