@@ -43,7 +43,7 @@ class Faults(unittest.TestCase):
         if OPTIMISED:
             self.assertTrue(str(caught.exception).startswith(message_start), caught.exception)
 
-    def test_added_logical_not_in_the_list_renames_nothing(self):
+    def testAddedLogicalNotInTheListRenamesNothing(self):
         source = 'class A:\n    def f(self):\n        x = 1\n'
         lst = Named(source)
         stray = LogicalLineType(('y', '=', '2'), 9, 0, 0)
@@ -79,7 +79,7 @@ class Faults(unittest.TestCase):
         finally:
             sbc._fastaccess = real
 
-    def test_unplaceable_comment_run_fails_instead_of_looping(self):
+    def testUnplaceableCommentRunFailsInsteadOfLooping(self):
         # The comment step meets a non-logical and answers 0; before, the
         # visiting loop restarted for ever (first layout) or returned with
         # the added comment unnamed (second layout).
@@ -94,7 +94,7 @@ class Faults(unittest.TestCase):
             self.assertIn('Argument must be a logical', err.getvalue())
             self.assertEqual(finder.FindChanges([], []), (set(), set(), set()), 'left idle')
 
-    def test_comment_step_override_that_fails_is_refused(self):
+    def testCommentStepOverrideThatFailsIsRefused(self):
         source = 'def f():\n    x = 1\n# c\ny = 2\n'
 
         class Raising(CChangeFinder):
@@ -113,7 +113,7 @@ class Faults(unittest.TestCase):
                 self.assertFailsClearly(lambda: cls(lst).FindChanges([new], []),
                                         '_ProcessDedentedComments answered 0')
 
-    def test_failing_prepare_or_clear_leaves_the_finder_usable(self):
+    def testFailingPrepareOrClearLeavesTheFinderUsable(self):
         source = 'class A:\n    def f(self):\n        x = 1\n'
 
         class PrepareFails(CChangeFinder):
@@ -143,7 +143,7 @@ class Faults(unittest.TestCase):
             self.assertEqual(result[1], set(['A#0']), cls.__name__)
             self.assertNamedFresh(lst, source)
 
-    def test_arguments_outlive_an_override_that_clears_the_keyword_dict(self):
+    def testArgumentsOutliveAnOverrideThatClearsTheKeywordDict(self):
         source = 'def f():\n    a = 1\n    b = 2\n'
         lst = Named(source)
         kwargs = {}
@@ -160,7 +160,7 @@ class Faults(unittest.TestCase):
         Clearing(lst).FindChanges(**kwargs)
         self.assertNamedFresh(lst, new_source)
 
-    def test_undo_that_puts_back_the_removed_objects(self):
+    def testUndoThatPutsBackTheRemovedObjects(self):
         # Renaming A to its sibling's name makes it B#1; the undo puts back
         # the removed objects themselves (all or some), still carrying their
         # old names, which equal what a fresh pass gives them.
@@ -196,7 +196,7 @@ class Faults(unittest.TestCase):
     def ClearChanged(cache, changes):
         cache.Clear(list(changes[0] | changes[1] | changes[2]))
 
-    def test_scope_prefix_must_end_at_a_separator(self):
+    def testScopePrefixMustEndAtASeparator(self):
         lst = Read('x = 1\ny = 2\nz = 3\nw = 4\n')
         for logical, name in zip(lst, ['f#1', 'f#1.g#0', 'f#10', 'f#1']):
             logical.fScopeName = name
