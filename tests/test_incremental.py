@@ -24,6 +24,13 @@ class Spy(CChangeFinder):
         return CChangeFinder._ProcessDedentedComments(self, i)
 
 
+class Routed(CChangeFinder):
+    """Takes every step through the overrides' route."""
+
+    def _Clear(self):
+        CChangeFinder._Clear(self)
+
+
 def Edited(old, *new, **kwargs):
     """(list, finder, result) of the edit old -> new after a whole-list pass."""
     lst = Read(old)
@@ -106,6 +113,25 @@ class ForwardScanTest(unittest.TestCase):
         self.assertEqual(Names(lst), WholeListNames(old.replace('class A', 'class B')))
         self.assertEqual(classes, set(['A#0', 'B#0']))
         self.assertEqual(functions, set(['A#0.f#0', 'A#0.g#0', 'B#0.f#0', 'B#0.g#0']))
+
+    def testHeaderTypedInPlaceAgreesWithTheRoutedSteps(self):
+        # A header that reads as before spares the scan of its body; every
+        # other edit of it still renames what follows.
+        body = ''.join('        v%d = %d\n' % (k, k) for k in range(6))
+        nested = ('class C:\n    def f(self):\n' + body + '    for x in y:\n' + body +
+               '    def g(self):\n        pass\n    z = 1\n')
+        block = 'def f():\n    a = 1\n    if a:\n' + body + 'b = 2\n'
+        method = 'class C:\n    x = 1\n    def f(self):\n' + body + 'y = 2\n'
+        for old, new in [(nested, nested.replace('def f(self)', 'def f(self, q)')),
+                         (nested, nested.replace('for x in y', 'for x in yz')),
+                         (nested, nested.replace('def f(self)', 'class f(object)')),
+                         (nested, nested.replace('def f(self)', 'def g(self)')),
+                         (nested, nested.replace('def f(self)', 'def h(self)')),
+                         (block, block.replace('    if a:', 'if a:')),
+                         (method, method.replace('    def f(self)', 'def f(self)'))]:
+            lst, _, result = Edited(old, new)
+            self.assertEqual(Names(lst), WholeListNames(new), new)
+            self.assertEqual(result, Edited(old, new, finder_class=Routed)[2], new)
 
 
 class IndexRepairTest(unittest.TestCase):

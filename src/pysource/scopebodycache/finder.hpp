@@ -126,6 +126,11 @@ struct NativePass {
     // While true, a finder without an index builds one at its first use.
     bool indexUsable = true;
     DefIndex* dropped = nullptr;  // dropped during the call; freed at its end
+    // A call that replaces one class/def line by another where it stood
+    // (typing in a header): the two, borrowed from the argument lists,
+    // which the call holds.
+    PyObject* replacedDefinition = nullptr;
+    PyObject* replacingDefinition = nullptr;
 };
 
 inline constexpr long kNoScanOwed = 1L << 20;
@@ -269,8 +274,15 @@ Py_ssize_t CommentRunEnd(PyObject* self, Py_ssize_t first);
 Py_ssize_t PlaceCommentRun(PyObject* self, Py_ssize_t first, Py_ssize_t end, const py::Ref* knownBase);
 // The native pass's way with the commonest edit, a code line replaced by
 // another at the same place (typing): the steps' own work for it, without
-// their general machinery. False, having done nothing, for any other edit.
+// their general machinery, and without the forward scan when the new line
+// reads as the old one did (the removed logical is trusted to be what
+// stood there, as the editor protocol has it). False, having done
+// nothing, for any other edit.
 bool ProcessTypedLine(PyObject* self, PyObject* addedList, PyObject* removedList);
+// Notes, for the native pass, a class/def line replaced by another where it
+// stood at the same indent: when the new one gets the old one's names, its
+// visit skips the forward scan (nothing a later line reads has changed).
+void NoteReplacedDefinition(PyObject* self, PyObject* addedList, PyObject* removedList);
 void ProcessNonDedentedComment(PyObject* self, PyObject* logical, Py_ssize_t i);
 void ScanForwardForChangedScopes(PyObject* self, Py_ssize_t start, long changedIndent);
 void UpdateScopesSeen(PyObject* self, Py_ssize_t end);

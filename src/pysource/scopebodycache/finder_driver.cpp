@@ -370,6 +370,7 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
                 pass.indexUsable = true;  // built afresh when first needed
             }
             if (!ProcessTypedLine(self, addedList, removedList)) {
+                NoteReplacedDefinition(self, addedList, removedList);
                 processRemoved(self, removedList, list);
                 processAdded(self, addedList, list);
             }

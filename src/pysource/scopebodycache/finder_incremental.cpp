@@ -164,10 +164,54 @@ bool ProcessTypedLine(PyObject* self, PyObject* addedList, PyObject* removedList
     setScopeName(a, scope.get());
     s.owedScanIndent = kNoScanOwed;
     LogicalInScopeChanged(self, added, scope.get(), Py_None, Py_None);
-    ScanForwardForChangedScopes(self, i + 1, a->fIndent);
+    // A code line that reads as the one it replaced (same indent, same
+    // scope; neither opens a scope) leaves every later line's look-back
+    // where it was: the scan would walk a block header's whole body to find
+    // nothing changed.
+    const bool sameReading = !isWhitespace(r) && a->fIndent == r->fIndent && compat::isStrExact(scope.get()) &&
+                             compat::strEqual(scope.get(), removedScope);
+    if (!sameReading) ScanForwardForChangedScopes(self, i + 1, a->fIndent);
     s.lastProcessedIndex = i;
     return true;
 }
+
+void NoteReplacedDefinition(PyObject* self, PyObject* addedList, PyObject* removedList) {
+    NativePass* pass = finderState(self).native;
+    if (pass == nullptr || PyList_GET_SIZE(addedList) != 1 || PyList_GET_SIZE(removedList) != 1) return;
+    PyObject* added = PyList_GET_ITEM(addedList, 0);
+    PyObject* removed = PyList_GET_ITEM(removedList, 0);
+    if (!logicalCheck(added) || !logicalCheck(removed)) return;
+    Logical* a = asLogical(added);
+    Logical* r = asLogical(removed);
+    if (!isScopeStart(a) || !isScopeStart(r) || a->fIndent != r->fIndent) return;
+    PyObject* list = finderState(self).logicalList;
+    const Py_ssize_t i = gNative.indexForLineno(list, r->fLineno);
+    if (i < 0 || i >= PyList_GET_SIZE(list) || PyList_GET_ITEM(list, i) != added) {
+        PyErr_Clear();
+        return;
+    }
+    pass->replacedDefinition = removed;
+    pass->replacingDefinition = added;
+}
+
+namespace {
+
+// Whether `logical`, just named, is the noted replacing class/def and
+// carries the names the replaced one had.
+bool readsAsReplacedDefinition(PyObject* self, PyObject* logicalObj) {
+    const NativePass* pass = finderState(self).native;
+    if (pass == nullptr || pass->replacingDefinition != logicalObj) return false;
+    const Logical* a = asLogical(logicalObj);
+    const Logical* r = asLogical(pass->replacedDefinition);
+    auto same = [](PyObject* x, PyObject* y) {
+        return x != nullptr && y != nullptr && compat::isStrExact(x) && compat::isStrExact(y) &&
+               compat::strEqual(x, y);
+    };
+    return a->fIndent == r->fIndent && same(a->fScopeName, r->fScopeName) &&
+           same(a->fLocalScopeName, r->fLocalScopeName);
+}
+
+}  // namespace
 
 void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t i) {
     py::Ref scope = route::FindScopeNameContainingLogical(self, i);
@@ -212,6 +256,7 @@ void ProcessNonDedentedComment(PyObject* self, PyObject* logicalObj, Py_ssize_t 
         previousLocal = py::Ref::none();
     }
     route::LogicalInScopeChanged(self, logicalObj, scope.get(), previous.get(), previousLocal.get());
+    if (owed == kNoScanOwed && readsAsReplacedDefinition(self, logicalObj)) return;
     ScanForwardForChangedScopes(self, i + 1, std::min<long>(owed, logical->fIndent));
 }
 
