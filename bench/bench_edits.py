@@ -10,6 +10,7 @@ these edits are made and undone, many times in a batch, and the batch's
 process CPU time divided by its FindChanges calls:
 
   typing       a statement replaced by a typed variant, and back;
+  in a header  a parameter typed into a method header, and back;
   def          a method header with a name new to its class, inserted and
                removed again (the list keeps its size);
   repeated def a header named like a later method of its class, which
@@ -40,7 +41,7 @@ except NameError:
     xrange = range
 
 kPlaces = (('start', 0.02), ('middle', 0.5), ('end', 0.98))
-kEdits = ('typing', 'def', 'repeated def', 'comment', 'batch')
+kEdits = ('typing', 'in a header', 'def', 'repeated def', 'comment', 'batch')
 
 
 def Find(lst, start, want):
@@ -87,6 +88,20 @@ def Pair(finder, first, second):
 def Typing(lst, finder, at):
     i = Find(lst, at, IsBodyStatement)
     old, new = lst[i], Typed(lst[i])
+
+    def Put(logical):
+        def Do():
+            lst[i] = logical
+        return Do
+    return Pair(finder, (Put(new), [new], [old]), (Put(old), [old], [new]))
+
+
+def InHeader(lst, finder, at):
+    # A parameter typed into a method header: the method keeps its name.
+    i = Find(lst, at, IsHeader('total'))
+    old = lst[i]
+    tokens = tuple(old.fTokens)
+    new = LogicalLineType(tokens[:-2] + (',', 'q') + tokens[-2:], old.fLineno, old.fIndent, old.fKind)
 
     def Put(logical):
         def Do():
@@ -150,7 +165,7 @@ def Batch(lst, finder, at):
     return Pair(finder, (Apply, news + [comment], olds), (Undo, olds, news + [comment]))
 
 
-kMakers = {'typing': Typing, 'def': DefLine, 'repeated def': RepeatedDef, 'comment': Comment, 'batch': Batch}
+kMakers = {'typing': Typing, 'in a header': InHeader, 'def': DefLine, 'repeated def': RepeatedDef, 'comment': Comment, 'batch': Batch}
 
 
 def TimeEdit(maker, lst, finder, at, batches, calls):

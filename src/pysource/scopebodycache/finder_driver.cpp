@@ -403,13 +403,13 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
 // What a call costs (2-core machine, process CPU time; bench/ reruns it):
 // with nothing to do, 0.13 us, most of it the Python call (the result
 // tuple and its three sets are those of the last call, once the caller has
-// dropped them); typing a character, 0.25-0.33 us at any file size (more
-// when a blank or comment line follows it); a method header in or out,
-// about 0.9 us; a header that renumbers a later namesake and renames its
-// body, about 1.7 us; the whole-list pass, 57-87 ns per fresh logical and
-// 45-47 ns per named one. On an override's route typing costs 1.6-3 us,
-// and a definition edit walks the scopes-seen table over the whole list
-// (about 70 ns per logical).
+// dropped them); typing a character, 0.25 us at any file size, and a
+// parameter into a method header 1.2 us whatever the body under it; a
+// method header in or out, about 0.9 us; a header that renumbers a later
+// namesake and renames its body, about 1.7 us; the whole-list pass, 57-87
+// ns per fresh logical and 45-47 ns per named one. On an override's route
+// typing costs 1.6-3 us, and a definition edit walks the scopes-seen table
+// over the whole list (about 70 ns per logical).
 //
 // The editor protocol. Between two calls the caller edits the list in place
 // and then passes what it inserted (added_list) and what it took out
