@@ -127,10 +127,9 @@ struct NativePass {
     bool indexUsable = true;
     DefIndex* dropped = nullptr;  // dropped during the call; freed at its end
     // A call that replaces one class/def line by another where it stood
-    // (typing in a header): the two, borrowed from the argument lists,
-    // which the call holds.
-    PyObject* replacedDefinition = nullptr;
-    PyObject* replacingDefinition = nullptr;
+    // (typing in a header): the two.
+    py::Ref replacedDefinition;
+    py::Ref replacingDefinition;
 };
 
 inline constexpr long kNoScanOwed = 1L << 20;

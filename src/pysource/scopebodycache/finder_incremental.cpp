@@ -190,8 +190,8 @@ void NoteReplacedDefinition(PyObject* self, PyObject* addedList, PyObject* remov
         PyErr_Clear();
         return;
     }
-    pass->replacedDefinition = removed;
-    pass->replacingDefinition = added;
+    pass->replacedDefinition = py::Ref::own(removed);
+    pass->replacingDefinition = py::Ref::own(added);
 }
 
 namespace {
@@ -200,9 +200,9 @@ namespace {
 // carries the names the replaced one had.
 bool readsAsReplacedDefinition(PyObject* self, PyObject* logicalObj) {
     const NativePass* pass = finderState(self).native;
-    if (pass == nullptr || pass->replacingDefinition != logicalObj) return false;
+    if (pass == nullptr || pass->replacingDefinition.get() != logicalObj) return false;
     const Logical* a = asLogical(logicalObj);
-    const Logical* r = asLogical(pass->replacedDefinition);
+    const Logical* r = asLogical(pass->replacedDefinition.get());
     auto same = [](PyObject* x, PyObject* y) {
         return x != nullptr && y != nullptr && compat::isStrExact(x) && compat::isStrExact(y) &&
                compat::strEqual(x, y);
