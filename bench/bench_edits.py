@@ -85,15 +85,20 @@ def Pair(finder, first, second):
     return Run, Bare
 
 
-def Typing(lst, finder, at):
-    i = Find(lst, at, IsBodyStatement)
-    old, new = lst[i], Typed(lst[i])
+def Replaced(lst, finder, i, new):
+    """lst[i] replaced by `new` and put back, as typing does."""
+    old = lst[i]
 
     def Put(logical):
         def Do():
             lst[i] = logical
         return Do
     return Pair(finder, (Put(new), [new], [old]), (Put(old), [old], [new]))
+
+
+def Typing(lst, finder, at):
+    i = Find(lst, at, IsBodyStatement)
+    return Replaced(lst, finder, i, Typed(lst[i]))
 
 
 def InHeader(lst, finder, at):
@@ -101,13 +106,8 @@ def InHeader(lst, finder, at):
     i = Find(lst, at, IsHeader('total'))
     old = lst[i]
     tokens = tuple(old.fTokens)
-    new = LogicalLineType(tokens[:-2] + (',', 'q') + tokens[-2:], old.fLineno, old.fIndent, old.fKind)
-
-    def Put(logical):
-        def Do():
-            lst[i] = logical
-        return Do
-    return Pair(finder, (Put(new), [new], [old]), (Put(old), [old], [new]))
+    return Replaced(lst, finder, i, LogicalLineType(tokens[:-2] + (',', 'q') + tokens[-2:], old.fLineno,
+                                                    old.fIndent, old.fKind))
 
 
 def InAndOut(lst, finder, i, logical):
