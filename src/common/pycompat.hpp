@@ -696,7 +696,7 @@ inline CharsView strChars(PyObject* s) {
 
 // A new str of `n` characters of `width` bytes each (code points on 3.x,
 // bytes on 2.7); null with an exception set.
-inline PyObject* strFromChars(const void* data, int width, Py_ssize_t n) noexcept {
+inline PyObject* strFromWidth(const void* data, int width, Py_ssize_t n) noexcept {
 #if PY_MAJOR_VERSION >= 3
     return PyUnicode_FromKindAndData(width, data, n);
 #else

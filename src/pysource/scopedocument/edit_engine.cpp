@@ -367,7 +367,7 @@ py::Ref setText(Document& d, PyObject* source) {
     // The one edit, in lines and columns of the current text.
     const size_t startRow = rowOfOffset(d, head) - 1;
     const size_t endRow = rowOfOffset(d, old - tail) - 1;
-    py::Ref middle = py::check(compat::strFromChars(
+    py::Ref middle = py::check(compat::strFromWidth(
         static_cast<const uint8_t*>(chars.data) + head * chars.width, chars.width, n - tail - head));
     py::Ref sl = py::check(compat::intFromSsize(startRow + 1));
     py::Ref sc = py::check(compat::intFromSsize(head - d.rows.start(startRow, old)));

@@ -126,14 +126,14 @@ void TextStore::copyOut(size_t start, size_t end, std::vector<uint32_t>& out) co
 PyObject* TextStore::slice(size_t start, size_t end) {
     const size_t w = static_cast<size_t>(width_);
     const uint8_t* b = buf_.data();
-    if (end <= gapStart_) return py::check(compat::strFromChars(b + start * w, width_, end - start)).release();
+    if (end <= gapStart_) return py::check(compat::strFromWidth(b + start * w, width_, end - start)).release();
     if (start >= gapStart_) {
         const size_t gap = gapEnd_ - gapStart_;
-        return py::check(compat::strFromChars(b + (start + gap) * w, width_, end - start)).release();
+        return py::check(compat::strFromWidth(b + (start + gap) * w, width_, end - start)).release();
     }
     // Across the gap: moved so that the slice is contiguous.
     moveGap(end);
-    return py::check(compat::strFromChars(b + start * w, width_, end - start)).release();
+    return py::check(compat::strFromWidth(b + start * w, width_, end - start)).release();
 }
 
 size_t TextStore::findNewline(size_t from) const noexcept {
