@@ -217,7 +217,7 @@ void RowTable::reserveGap(size_t rows, size_t textSize) {
 }
 
 void RowTable::replace(size_t first, size_t removed, const std::vector<size_t>& newStarts, size_t newTextSize,
-                       size_t oldTextSize) {
+                       size_t oldTextSize, const RowState* states, const int16_t* columns) {
     requireFits(newTextSize);
     // The rows after first+removed keep their offsets from the end; those
     // up to `first` keep theirs from the start.
@@ -226,8 +226,8 @@ void RowTable::replace(size_t first, size_t removed, const std::vector<size_t>& 
     reserveGap(newStarts.size(), newTextSize);
     for (size_t k = 0; k < newStarts.size(); ++k) {
         starts_[gapStart_] = static_cast<uint32_t>(newStarts[k]);
-        states_[gapStart_] = RowState();
-        columns_[gapStart_] = kNoIndentCheck;
+        states_[gapStart_] = states ? states[k] : RowState();
+        columns_[gapStart_] = columns ? columns[k] : kNoIndentCheck;
         ++gapStart_;
     }
 }

@@ -101,8 +101,10 @@ public:
     // starting at `newStarts` (offsets in the text after the edit, whose
     // size is `newTextSize`) put in their place; the rows after shift by
     // `delta` characters. States and columns of the new rows are unset.
+    // With `states` and `columns` (one per new row) the new rows take
+    // them; an edit undone puts back what it took out.
     void replace(size_t first, size_t removed, const std::vector<size_t>& newStarts, size_t newTextSize,
-                 size_t oldTextSize);
+                 size_t oldTextSize, const RowState* states = nullptr, const int16_t* columns = nullptr);
     size_t bytesHeld() const noexcept {
         return starts_.capacity() * sizeof(uint32_t) + states_.capacity() * sizeof(RowState) +
                columns_.capacity() * sizeof(int16_t);
