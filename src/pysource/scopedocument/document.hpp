@@ -134,6 +134,9 @@ py::Ref readWhole(Document& d);
 // Reads the damaged part again and, when the text reads, brings the list,
 // the names and the cache to it.
 void reread(Document& d, EditOutcome& out);
+// How the rows' states and columns differ from a whole scan of the text
+// (empty when they agree). Only for a text that reads.
+std::string checkRowStates(Document& d);
 // The length of a leading BOM of the text (0 without one).
 size_t bomLength(const Document& d);
 

@@ -30,6 +30,7 @@
 #include <algorithm>
 #include <climits>
 #include <cstring>
+#include <string>
 
 namespace sdoc {
 
@@ -351,7 +352,35 @@ void rereadAs(Document& d, EditOutcome& out) {
     clearCache(d, out.changes.get());
 }
 
+template <class Char>
+std::string checkRowsAs(Document& d) {
+    const size_t bom = bomLength(d);
+    const Char* p = static_cast<const Char*>(d.text.contiguousFrom(bom));
+    Scanner<Char> scanner(p, d.text.size() - bom);
+    const size_t count = d.rows.count();
+    size_t row = 0;
+    auto describe = [](const char* what, size_t r) {
+        return std::string("row ") + std::to_string(r + 1) + ": its " + what + " differs from a whole scan's";
+    };
+    if (d.rows.state(0) != pack(scanner.state())) return describe("entry state", 0);
+    while (scanner.scanRow()) {
+        if (d.rows.column(row) != columnOf(scanner.rowIndentColumn())) return describe("indentation column", row);
+        ++row;
+        if (row < count && d.rows.state(row) != pack(scanner.state())) return describe("entry state", row);
+    }
+    return std::string();
+}
+
 }  // namespace
+
+std::string checkRowStates(Document& d) {
+    switch (d.text.width()) {
+    case 1: return checkRowsAs<uint8_t>(d);
+    case 2: if constexpr (compat::kPython3) return checkRowsAs<uint16_t>(d); break;
+    default: if constexpr (compat::kPython3) return checkRowsAs<uint32_t>(d); break;
+    }
+    return "a 2.7 text holds bytes only";
+}
 
 size_t bomLength(const Document& d) {
     const TextStore& t = d.text;
