@@ -128,6 +128,21 @@ py::Ref makeError(Document& d, ErrorKind kind, int64_t lineno, int64_t offset, p
 template <class Char>
 py::Ref eofError(Document& d, const reader::ScanError& error) {
     const size_t bom = bomLength(d);
+    if (d.text.carriageReturns() == 0) {
+        // Its lines are its rows (a last empty row is no line).
+        const size_t count = d.rows.count();
+        const size_t n = d.text.size();
+        const int64_t lineno = error.lineno;
+        py::Ref text;
+        if (lineno >= 1 && static_cast<size_t>(lineno) <= count) {
+            const size_t r = static_cast<size_t>(lineno - 1);
+            const size_t start = d.rows.start(r, n) + (r == 0 ? bom : 0);
+            if (r + 1 < count || start < n) {
+                text = py::Ref::steal(d.text.slice(start, d.rows.start(r, n) + rowLength(d, r)));
+            }
+        }
+        return makeError(d, error.kind, error.lineno, error.offset, std::move(text));
+    }
     const Char* p = static_cast<const Char*>(d.text.contiguousFrom(bom));
     size_t begin = 0, end = 0;
     py::Ref text;
@@ -199,11 +214,15 @@ void clearCache(Document& d, PyObject* changes) {
 }
 
 template <class Char>
-py::Ref makeLogicals(const Scanner<Char>& scanner, const Char* text, size_t length, Document& d) {
+py::Ref makeLogicals(const Scanner<Char>& scanner, const Char* text, Document& d) {
     const auto& records = scanner.records();
     py::Ref list = py::check(PyList_New(static_cast<Py_ssize_t>(records.size())));
     if (records.empty()) return list;
-    reader::TokenMaker<Char> tokens(text, length, false);
+    // The table of shared tokens is sized by the text it serves: the
+    // characters the records span, not the text to its end.
+    const auto& spans = scanner.tokens();
+    const size_t spanned = spans.empty() ? 0 : spans.back().end - spans.front().begin;
+    reader::TokenMaker<Char> tokens(text, spanned, false);
     const reader::RecordMaker maker{reinterpret_cast<PyObject*>(gImports.logicalType), gImports.logicalType};
     for (size_t i = 0; i < records.size(); ++i) {
         PyObject* logical = reader::makeLogical(scanner, records[i], tokens, maker);
@@ -237,7 +256,7 @@ py::Ref readWholeAs(Document& d) {
     }
     // The text may have moved: the scanner's spans are offsets from `bom`.
     p = static_cast<const Char*>(d.text.contiguousFrom(bom));
-    return makeLogicals(scanner, p, length, d);
+    return makeLogicals(scanner, p, d);
 }
 
 template <class Char>
@@ -301,7 +320,7 @@ void rereadAs(Document& d, EditOutcome& out) {
 
     // The text reads: make the new logicals before anything changes.
     p = static_cast<const Char*>(d.text.contiguousFrom(base));
-    py::Ref fresh = makeLogicals(scanner, p, n - base, d);
+    py::Ref fresh = makeLogicals(scanner, p, d);
     PyObject* list = d.list.get();
     const Py_ssize_t i0 = lowerBound(list, static_cast<int64_t>(first) + 1);
     const Py_ssize_t i1 = converged ? lowerBound(list, static_cast<int64_t>(baseEnd) + 1) : PyList_GET_SIZE(list);

@@ -39,6 +39,8 @@ void TextStore::assign(const void* data, int width, size_t n) {
     if (width > 1) {
         for (size_t i = 0; i < n && need < width; ++i) need = std::max(need, widthOf(charAt(data, width, i)));
     }
+    carriageReturns_ = 0;
+    for (size_t i = 0; i < n; ++i) carriageReturns_ += charAt(data, width, i) == '\r';
     std::vector<uint8_t> fresh((n + 64) * need);
     buf_.swap(fresh);
     width_ = need;
@@ -99,6 +101,8 @@ void TextStore::replace(size_t start, size_t end, const void* data, int width, s
         for (size_t i = 0; i < n && need < width; ++i) need = std::max(need, widthOf(charAt(data, width, i)));
     }
     if (need > width_) widen(need);
+    for (size_t i = start; i < end; ++i) carriageReturns_ -= at(i) == '\r';
+    for (size_t i = 0; i < n; ++i) carriageReturns_ += charAt(data, width, i) == '\r';
     moveGap(end);
     // The removed characters join the gap.
     gapStart_ = start;

@@ -50,6 +50,9 @@ public:
     // Where the next '\n' at or after `from` is; size() when there is none.
     size_t findNewline(size_t from) const noexcept;
     size_t bytesHeld() const noexcept { return buf_.capacity(); }
+    // How many '\r' the text holds: without any, its lines split at
+    // '\r\n', '\r' and '\n' are its rows.
+    size_t carriageReturns() const noexcept { return carriageReturns_; }
 
 private:
     void moveGap(size_t pos) noexcept;
@@ -69,6 +72,7 @@ private:
     size_t gapStart_ = 0;       // characters
     size_t gapEnd_ = 0;
     size_t capacity_ = 0;       // characters
+    size_t carriageReturns_ = 0;
 };
 
 // What the reader leaves at the break before a row. Opaque here: the
