@@ -91,6 +91,19 @@ struct EditOutcome {
     size_t regionFirstLine = 1, regionOldLines = 0, regionNewLines = 0;
 };
 
+// Refuses a call that comes back into the document while it is being
+// changed or checked (Python code run meanwhile).
+class BusyGuard {
+public:
+    explicit BusyGuard(Document& d);
+    ~BusyGuard() { d_.busy = false; }
+    BusyGuard(const BusyGuard&) = delete;
+    BusyGuard& operator=(const BusyGuard&) = delete;
+
+private:
+    Document& d_;
+};
+
 // --- document_type.cpp -----------------------------------------------------------
 PyTypeObject* documentType() noexcept;
 void readyDocumentType();

@@ -185,17 +185,6 @@ py::Ref finishEdit(Document& d, EditOutcome& out) {
     return result;
 }
 
-class BusyGuard {
-public:
-    explicit BusyGuard(Document& d) : d_(d) {
-        if (d.busy) msg::raise(PyExc_RuntimeError, "the document is being edited (a call came back into it)");
-        d.busy = true;
-    }
-    ~BusyGuard() { d_.busy = false; }
-
-private:
-    Document& d_;
-};
 
 }  // namespace
 

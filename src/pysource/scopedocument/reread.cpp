@@ -198,6 +198,26 @@ bool checkRowsBelow(Document& d, std::vector<int64_t> stack, size_t from, int64_
     return true;
 }
 
+// The logicals are the document's own, but a caller holding one can set its
+// line number. Around the re-read ones they must still be in order, or the
+// place found for them would be wrong.
+void requireInOrder(PyObject* list, Py_ssize_t i0, Py_ssize_t i1) {
+    const Py_ssize_t n = PyList_GET_SIZE(list);
+    const Py_ssize_t from = i0 > 0 ? i0 - 1 : 0;
+    const Py_ssize_t to = std::min(n, i1 + 2);
+    for (Py_ssize_t k = from; k + 1 < to; ++k) {
+        const int32_t a = record(PyList_GET_ITEM(list, k))->fLineno;
+        const int32_t b = record(PyList_GET_ITEM(list, k + 1))->fLineno;
+        if (a > b) {
+            PyErr_Format(PyExc_RuntimeError,
+                         "the document's logicals were changed from outside (line %d before line %d); "
+                         "the edit is not made (SelfCheck() describes the difference)",
+                         static_cast<int>(a), static_cast<int>(b));
+            py::fail();
+        }
+    }
+}
+
 void shiftBelow(PyObject* list, Py_ssize_t from, long delta) {
     if (delta == 0) return;
     const Py_ssize_t n = PyList_GET_SIZE(list);
@@ -324,6 +344,7 @@ void rereadAs(Document& d, EditOutcome& out) {
     PyObject* list = d.list.get();
     const Py_ssize_t i0 = lowerBound(list, static_cast<int64_t>(first) + 1);
     const Py_ssize_t i1 = converged ? lowerBound(list, static_cast<int64_t>(baseEnd) + 1) : PyList_GET_SIZE(list);
+    requireInOrder(list, i0, i1);
     const Py_ssize_t m = PyList_GET_SIZE(fresh.get());
     Py_ssize_t head = 0;
     while (head < m && i0 + head < i1) {

@@ -55,7 +55,8 @@ py::Ref call(const char* function, PyObject* a, PyObject* b, PyObject* c) {
 void selfCheck(Document& d) {
     std::string problems;
     checkRows(d, problems);
-    PyObject* text = wholeText(d);
+    py::Ref held = py::Ref::own(wholeText(d));
+    PyObject* text = held.get();
     py::Ref logicals = logicalsCopy(d);
     if (d.readable) {
         const std::string rows = checkRowStates(d);
