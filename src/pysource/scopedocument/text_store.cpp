@@ -173,8 +173,9 @@ void RowTable::assign(const TextStore& text) {
     }
     const size_t rows = starts.size();
     const size_t capacity = rows + 16;
-    starts.resize(capacity);
-    starts_.swap(starts);
+    // Exactly that: pushing left up to twice the room.
+    starts_.assign(capacity, 0);
+    std::copy(starts.begin(), starts.end(), starts_.begin());
     states_.assign(capacity, RowState());
     columns_.assign(capacity, kNoIndentCheck);
     gapStart_ = rows;
@@ -205,7 +206,9 @@ void RowTable::reserveGap(size_t rows, size_t textSize) {
     if (gap() >= rows) return;
     (void)textSize;
     const size_t used = count();
-    const size_t capacity = used + rows + std::max<size_t>(16, used / 8);
+    // A thirty-second spare: a line count that changes often reuses it,
+    // and the rows stay near 14 bytes each.
+    const size_t capacity = used + rows + std::max<size_t>(16, used / 32);
     const size_t tail = starts_.size() - gapEnd_;
     auto grow = [&](auto& v, auto fill) {
         using V = std::decay_t<decltype(v)>;
