@@ -299,6 +299,31 @@ class ReadAgainOnlyWhatChangedTest(DocumentTestCase):
         self.assertMatchesFresh(self.doc)
 
 
+class IndentationBelowTheEditTest(DocumentTestCase):
+
+    def testADedentBelowIsCheckedAgainstTheNewStack(self):
+        text = 'if a:\n  if b:\n    x\n  y\n'
+        doc = CScopeDocument(text)
+        r = doc.Edit(2, 0, 2, 0, ' ')
+        self.assertEqual(r.fRegion, (2, 1, 1))
+        self.assertEqual((r.fError.msg, r.fError.lineno, r.fError.offset, r.fError.text),
+                         ('unindent does not match any outer indentation level', 4, 2, '  y\n'))
+        doc.SelfCheck()
+        r = doc.Edit(4, 0, 4, 0, ' ')
+        self.assertTrue(r.fReadable)
+        self.assertMatchesFresh(doc, 'if a:\n   if b:\n    x\n   y\n')
+
+    def testTheEmptyLastLineRunsNoCheck(self):
+        # The last line taken out leaves its row empty: what it held before
+        # must not be checked under a deeper block put in above.
+        doc = CScopeDocument('x = 1\n    y\n')
+        doc.Edit(2, 0, 3, 0, '')
+        doc.SelfCheck()
+        r = doc.Edit(1, 0, 1, 0, 'if a:\n        ')
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertMatchesFresh(doc, 'if a:\n        x = 1\n')
+
+
 class HandEditedLogicalsTest(unittest.TestCase):
 
     def testALineNumberChangedFromOutsideIsRefusedAndDetected(self):

@@ -23,20 +23,32 @@
 
 namespace sdoc {
 
-// The part of the current text that differs from the baseline's: current
+// A part of the current text that differs from the baseline's: current
 // characters [start, end) stand where the baseline had `baselineMiddle`.
-struct Damage {
-    bool active = false;
+struct DamageRange {
     size_t start = 0;
     size_t end = 0;
     std::vector<uint32_t> baselineMiddle;
-    long lineDelta = 0;       // current rows minus baseline rows
+    long lineDelta = 0;  // rows it added (negative: took out)
     // The least indentation column among the baseline's rows that edits
     // took out of the row table (INT64_MAX: none), and how many rows they took.
     int64_t droppedMinColumn = INT64_MAX;
     size_t rowsDropped = 0;
+};
+
+// Where the current text differs from the baseline's: ranges in text order,
+// apart from each other. Between them the text is the baseline's.
+struct Damage {
+    std::vector<DamageRange> ranges;
     size_t baselineRows = 0;  // rows of the baseline text
     bool baselineEndsWithNewline = false;
+
+    bool active() const noexcept { return !ranges.empty(); }
+    long lineDelta() const noexcept {
+        long delta = 0;
+        for (const DamageRange& r : ranges) delta += r.lineDelta;
+        return delta;
+    }
 };
 
 struct EditStats {

@@ -248,9 +248,11 @@ PyObject* m_GetLastEditStats(PyObject* self, PyObject*) {
 PyObject* m_MemoryUse(PyObject* self, PyObject*) {
     return py::guarded([&]() -> PyObject* {
         Document& d = ready(self);
+        size_t damage = 0;
+        for (const DamageRange& r : d.damage.ranges) damage += r.baselineMiddle.capacity() * sizeof(uint32_t);
         return Py_BuildValue("{s:n,s:n,s:n}", "text", static_cast<Py_ssize_t>(d.text.bytesHeld()), "rows",
                              static_cast<Py_ssize_t>(d.rows.bytesHeld()), "damage",
-                             static_cast<Py_ssize_t>(d.damage.baselineMiddle.capacity() * sizeof(uint32_t)));
+                             static_cast<Py_ssize_t>(damage));
     });
 }
 
