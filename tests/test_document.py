@@ -139,6 +139,27 @@ class EditResultTest(DocumentTestCase):
         self.assertMatchesFresh(doc, text)
         self.assertEqual(doc.GetLastEditStats()['edits'], 3)
 
+    def testEditsFarApartAreReadEachWhereItIs(self):
+        text = ''.join('v%d = %d\n' % (k, k) for k in range(400))
+        doc = CScopeDocument(text)
+        keep = doc.GetLogicals()
+        # Bottom first, as an editor sends the edits of several cursors.
+        r = doc.EditMany([(300, 0, 300, 4, 'w300'), (2, 0, 2, 0, 'def f():\n    pass\n')])
+        self.assertLessEqual(doc.GetLastEditStats()['rows_scanned'], 4)
+        self.assertEqual([(l.fTokens[0], l.fLineno) for l in r.fAdded], [('def', 2), ('pass', 3), ('w300', 302)])
+        # A removed logical carries its number as the edits above it left it.
+        self.assertEqual([(l.fTokens[0], l.fLineno) for l in r.fRemoved], [('v299', 302)])
+        self.assertEqual(r.fRegion, (2, 299, 301))
+        self.assertEqual(sum(1 for a, b in zip(keep[1:], doc.GetLogicals()[3:]) if a is b), 398)
+        self.assertMatchesFresh(doc)
+
+    def testEditsThatMeetAreReadTogether(self):
+        doc = CScopeDocument(kSample)
+        # The first opens a bracket the second closes lines below.
+        r = doc.EditMany([(1, 9, 1, 9, ' (1,'), (3, 0, 3, 0, ')\n')])
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertMatchesFresh(doc)
+
     def testEmptyBatchAndSameText(self):
         doc = CScopeDocument(kSample)
         for r in (doc.EditMany([]), doc.SetText(kSample), doc.Edit(3, 2, 3, 2, '')):
