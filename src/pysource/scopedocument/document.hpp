@@ -186,7 +186,6 @@ py::Ref makeEditResult(Document& d, EditOutcome& outcome);
 // --- imports.cpp -------------------------------------------------------------------------
 // What the document uses of the other modules, bound at import.
 struct Imports {
-    PyObject* readLogicals;     // pysource.logicals.ReadLogicals
     PyObject* decodeSource;     // pysource.logicals._SourceText (3.x bytes)
     PyObject* changeFinder;     // pysource.scopebodycache.CChangeFinder
     PyObject* bodyCache;        // pysource.scopebodycache.CScopeBodyCache

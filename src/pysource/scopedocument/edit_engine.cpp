@@ -3,27 +3,25 @@
 //
 // A batch of edits is applied to the text in order; every edit is checked
 // against the text the ones before it left, and a bad one undoes them all.
-// The span the batch touched (with what the baseline held there) is the
-// damage. The text is then read: when it reads, the logicals that differ
-// from the list's replace them (the same objects stay for the rest, with
-// their line numbers shifted), FindChanges names them and the cache forgets
-// the changed scopes; when it does not, the list stays as the baseline and
-// the damage stays for the next edit.
+// The ranges the batch touched (with what the baseline held there) join the
+// damage. The damage is then read again (reread.cpp): when the text reads,
+// the logicals that differ from the list's replace them (the same objects
+// stay for the rest, with their line numbers shifted), FindChanges names
+// them and the cache forgets the changed scopes; when it does not, the list
+// stays as the baseline and the damage stays for the next edit.
 //
-// Python code runs here only in the reader, the finder and the cache (all
-// of them the project's own, on the document's private list) and in the
-// destructors of the logicals dropped; `busy` refuses a call that comes
-// back into the document meanwhile.
+// Python code runs here only in the finder and the cache (the project's own,
+// on the document's private list), in the self-check and in the destructors
+// of the logicals dropped; `busy` refuses a call that comes back into the
+// document meanwhile.
 #include "common/messages.hpp"
 #include "common/pycompat.hpp"
-#include "pysource/contracts/logical_record.hpp"
 #include "pysource/scopedocument/document.hpp"
 
 #include <algorithm>
 
 namespace sdoc {
 
-using contracts::LogicalLineObject;
 
 bool gCheckEveryEdit = false;
 
