@@ -183,23 +183,29 @@ void RowTable::assign(const TextStore& text) {
 }
 
 void RowTable::moveGap(size_t pos, size_t textSize) noexcept {
-    const size_t g = gap();
-    while (gapStart_ > pos) {
-        // Row gapStart_-1 goes after the gap: counted from the end.
-        --gapStart_;
-        --gapEnd_;
-        starts_[gapEnd_] = static_cast<uint32_t>(textSize - starts_[gapStart_]);
-        states_[gapEnd_] = states_[gapStart_];
-        columns_[gapEnd_] = columns_[gapStart_];
+    if (pos == gapStart_) return;
+    // The rows that cross the gap move as blocks; their starts change from
+    // offsets from the start to offsets from the end, or back.
+    size_t from, to, k;
+    if (pos < gapStart_) {
+        k = gapStart_ - pos;
+        from = pos;
+        to = gapEnd_ - k;
+        gapStart_ = pos;
+        gapEnd_ = to;
+    } else {
+        k = pos - gapStart_;
+        from = gapEnd_;
+        to = gapStart_;
+        gapStart_ += k;
+        gapEnd_ += k;
     }
-    while (gapStart_ < pos) {
-        starts_[gapStart_] = static_cast<uint32_t>(textSize - starts_[gapEnd_]);
-        states_[gapStart_] = states_[gapEnd_];
-        columns_[gapStart_] = columns_[gapEnd_];
-        ++gapStart_;
-        ++gapEnd_;
-    }
-    (void)g;
+    std::memmove(&starts_[to], &starts_[from], k * sizeof(uint32_t));
+    std::memmove(&states_[to], &states_[from], k * sizeof(RowState));
+    std::memmove(&columns_[to], &columns_[from], k * sizeof(int16_t));
+    const uint32_t size = static_cast<uint32_t>(textSize);
+    uint32_t* starts = &starts_[to];
+    for (size_t i = 0; i < k; ++i) starts[i] = size - starts[i];
 }
 
 void RowTable::reserveGap(size_t rows, size_t textSize) {
