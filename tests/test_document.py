@@ -334,6 +334,18 @@ class IndentationBelowTheEditTest(DocumentTestCase):
         self.assertTrue(r.fReadable)
         self.assertMatchesFresh(doc, 'if a:\n   if b:\n    x\n   y\n')
 
+    def testTheLinesKeptWhileTheTextDoesNotReadAreTheLastReadables(self):
+        doc = CScopeDocument(kSample)
+        doc.EditMany([(16, 7, 16, 7, '['), (3, 0, 3, 0, '  ')])
+        self.assertFalse(doc.IsReadable())
+        doc.SelfCheck()   # the rows outside the edits against the last text that read
+        doc.Edit(10, 0, 12, 0, '')
+        doc.SelfCheck()
+        r = doc.EditMany([(14, 7, 14, 8, ''), (3, 0, 3, 2, '')])
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertEqual([l.fTokens[:2] for l in r.fRemoved if l.fKind == 2], [('def', 'f'), ('def', 'inner')])
+        self.assertMatchesFresh(doc)
+
     def testTheEmptyLastLineRunsNoCheck(self):
         # The last line taken out leaves its row empty: what it held before
         # must not be checked under a deeper block put in above.

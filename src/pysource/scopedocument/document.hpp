@@ -162,6 +162,9 @@ void reread(Document& d, EditOutcome& out);
 // How the rows' states and columns differ from a whole scan of the text
 // (empty when they agree). Only for a text that reads.
 std::string checkRowStates(Document& d);
+// The same for a text that does not read: the rows outside the damage
+// against a whole scan of `baseline`, the last text that read.
+std::string checkBaselineRows(Document& d, PyObject* baseline);
 // The length of a leading BOM of the text (0 without one).
 size_t bomLength(const Document& d);
 
@@ -173,6 +176,9 @@ py::Ref logicalsCopy(Document& d);
 
 // --- pickling.cpp ------------------------------------------------------------------------
 py::Ref reduceDocument(PyObject* self, Document& d);
+// The text of the last readable text (the current one with the damage put
+// back).
+py::Ref baselineText(Document& d);
 void restoreDocument(PyObject* self, PyObject* state);
 
 // --- self_check.cpp ---------------------------------------------------------------------

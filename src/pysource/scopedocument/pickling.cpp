@@ -10,8 +10,6 @@
 
 namespace sdoc {
 
-namespace {
-
 // The baseline's text: the current one with the damage put back.
 py::Ref baselineText(Document& d) {
     std::vector<uint32_t> chars;
@@ -24,8 +22,6 @@ py::Ref baselineText(Document& d) {
     d.text.copyOut(at, d.text.size(), chars);
     return py::check(compat::strFromWidth(chars.data(), 4, static_cast<Py_ssize_t>(chars.size())));
 }
-
-}  // namespace
 
 py::Ref reduceDocument(PyObject* self, Document& d) {
     py::Ref state = d.readable ? py::Ref::none() : baselineText(d);

@@ -535,7 +535,68 @@ std::string checkRowsAs(Document& d) {
     return std::string();
 }
 
+// The rows outside the damage against a whole scan of the last text that
+// read: they must hold its states and columns, shifted by the rows the
+// damage above them added.
+template <class Char>
+std::string checkBaselineRowsAs(Document& d, const Char* text, size_t length) {
+    const size_t bom = compat::kPython3 ? (length >= 1 && text[0] == 0xFEFF ? 1 : 0)
+                                        : (length >= 3 && text[0] == 0xEF && text[1] == 0xBB && text[2] == 0xBF ? 3 : 0);
+    Scanner<Char> scanner(text + bom, length - bom);
+    std::vector<RowState> states{pack(scanner.state())};
+    std::vector<int16_t> columns;
+    while (scanner.scanRow()) {
+        columns.push_back(columnOf(scanner.rowIndentColumn()));
+        states.push_back(pack(scanner.state()));
+    }
+    const size_t baselineRows = d.damage.baselineRows;
+    columns.resize(baselineRows, kNoIndentCheck);
+    states.resize(baselineRows, RowState());
+    const size_t count = d.rows.count();
+    long delta = 0;
+    size_t r = 0;
+    auto compare = [&](size_t until, bool stateToo) -> std::string {
+        for (; r < until && r < count; ++r) {
+            const long b = static_cast<long>(r) - delta;
+            if (b < 0 || static_cast<size_t>(b) >= baselineRows) return "row " + std::to_string(r + 1) + " has no row in the last text that read";
+            if (stateToo && d.rows.state(r) != states[b]) {
+                return "row " + std::to_string(r + 1) + ": its entry state is not the last readable text's";
+            }
+            if (d.rows.column(r) != columns[b]) {
+                return "row " + std::to_string(r + 1) + ": its indentation column is not the last readable text's";
+            }
+            stateToo = true;
+        }
+        return std::string();
+    };
+    for (const DamageRange& range : d.damage.ranges) {
+        const size_t startRow = rowOfOffset(d, range.start) - 1;
+        const size_t afterRow = rowOfOffset(d, range.end);
+        std::string problem = compare(startRow, true);
+        if (!problem.empty()) return problem;
+        // The first damaged row starts as it did; what it holds has changed.
+        if (r == startRow && r < count && d.rows.state(r) != states[static_cast<size_t>(static_cast<long>(r) - delta)]) {
+            return "row " + std::to_string(r + 1) + ": its entry state is not the last readable text's";
+        }
+        r = std::max(r, afterRow);
+        delta += range.lineDelta;
+    }
+    return compare(count, true);
+}
+
 }  // namespace
+
+std::string checkBaselineRows(Document& d, PyObject* baseline) {
+    compat::TextChars chars;
+    if (!compat::textChars(baseline, &chars)) py::fail();
+    const size_t n = static_cast<size_t>(chars.length);
+    switch (chars.kind) {
+    case 1: return checkBaselineRowsAs(d, static_cast<const uint8_t*>(chars.data), n);
+    case 2: if constexpr (compat::kPython3) return checkBaselineRowsAs(d, static_cast<const uint16_t*>(chars.data), n); break;
+    default: if constexpr (compat::kPython3) return checkBaselineRowsAs(d, static_cast<const uint32_t*>(chars.data), n); break;
+    }
+    return "a 2.7 text holds bytes only";
+}
 
 std::string checkRowStates(Document& d) {
     switch (d.text.width()) {
