@@ -200,6 +200,31 @@ class RecordTest(unittest.TestCase):
         self.assertIs(got[0].fTokens[0], got[0].fTokens[4])
 
 
+    def testRecordTypeIsLookedUpAtEachRead(self):
+        import pysource._fastaccess as fastaccess
+
+        class Sub(LogicalLineType):
+            pass
+        fastaccess.LogicalLineType = Sub
+        try:
+            native, ref = logicals.ReadLogicals('x\n'), logicals.ReadLogicals('x\n', reference=True)
+        finally:
+            fastaccess.LogicalLineType = LogicalLineType
+        self.assertEqual((type(native[0]), type(ref[0])), (Sub, Sub))
+
+    def testCollectorStateKeptAcrossLongReads(self):
+        source = 'x = [1,\n 2]\n' * 5000
+        enabled = gc.isenabled()
+        try:
+            for state in (True, False):
+                (gc.enable if state else gc.disable)()
+                logicals.ReadLogicals(source)
+                self.assertRaises(SyntaxError, logicals.ReadLogicals, source + '(')
+                self.assertEqual(gc.isenabled(), state)
+        finally:
+            (gc.enable if enabled else gc.disable)()
+
+
 class ResumeTest(unittest.TestCase):
 
     def testRowStates(self):
@@ -215,6 +240,39 @@ class ResumeTest(unittest.TestCase):
         sources += list(reader_adversarial.Texts(7, 500))
         checked = sum(_reader.CheckResume(source) for source in sources)
         self.assertGreater(checked, 1000)
+
+
+class ToolTest(unittest.TestCase):
+
+    def testGeneratedTextsAreSeededAndReachEveryOutcome(self):
+        texts = list(reader_adversarial.Texts(3, 400))
+        self.assertEqual(texts, list(reader_adversarial.Texts(3, 400)))
+        outcomes = set()
+        for text in texts:
+            got = reader_adversarial.Outcome(text, False)
+            outcomes.add(got[1] + ': ' + got[2][0] if got[0] == 'error' else 'reads')
+        self.assertEqual(outcomes, set(['reads', 'SyntaxError: EOF in multi-line string',
+                                        'SyntaxError: EOF in multi-line statement',
+                                        'IndentationError: unindent does not match any outer indentation level']))
+
+    def testParityOverATree(self):
+        import reader_parity
+        tmp = tempfile.mkdtemp()
+        try:
+            for name, data in [('a.py', b'def f():\r\n  return 1\r'), ('b.py', b'x = (\n'),
+                               ('c.py', b'if 1:\n  x\n y\n')]:
+                with open(os.path.join(tmp, name), 'wb') as f:
+                    f.write(data)
+            saved, sys.stdout = sys.stdout, support.TextBuffer()
+            try:
+                status = reader_parity.NativeParity([tmp], 3)
+                printed = sys.stdout.getvalue()
+            finally:
+                sys.stdout = saved
+        finally:
+            shutil.rmtree(tmp)
+        self.assertEqual(status, 0)
+        self.assertIn('files 3, identical 3 (records 2, rejected alike 2), differing 0', printed)
 
 
 class ReferenceTest(unittest.TestCase):
