@@ -135,7 +135,7 @@ void requireEditText(PyObject* text);
 // Reads `source` into a fresh document state (text, rows, logicals, names).
 void openDocument(Document& d, PyObject* source, PyObject* filename);
 // One edit as the caller gave it (borrowed; the caller holds them).
-struct EditSpec {
+struct EditRequest {
     PyObject* startLine;
     PyObject* startColumn;
     PyObject* endLine;
@@ -144,7 +144,7 @@ struct EditSpec {
 };
 // Applies the edits in order, each in the coordinates the ones before it
 // left, as one change; returns the CEditResult. A bad edit changes nothing.
-py::Ref applyEdits(Document& d, const std::vector<EditSpec>& specs, bool utf16);
+py::Ref applyEdits(Document& d, const std::vector<EditRequest>& requests, bool utf16);
 // A whole new text as one edit.
 py::Ref setText(Document& d, PyObject* source);
 // The current text as a str (cached until the next edit).

@@ -132,14 +132,14 @@ void undoAll(Document& d, std::vector<Undo>& undo, const Damage& saved) {
 
 // Applies the batch to the text, keeping in `undo` what puts it back; on a
 // bad edit restores text, rows and damage and rethrows.
-void applyToText(Document& d, const std::vector<EditSpec>& specs, bool utf16, std::vector<Undo>& undo) {
+void applyToText(Document& d, const std::vector<EditRequest>& requests, bool utf16, std::vector<Undo>& undo) {
     const Damage saved = d.damage;
     try {
-        for (const EditSpec& spec : specs) {
-            const size_t start = offsetOf(d, spec.startLine, spec.startColumn, utf16, "start");
-            const size_t end = offsetOf(d, spec.endLine, spec.endColumn, utf16, "end");
+        for (const EditRequest& request : requests) {
+            const size_t start = offsetOf(d, request.startLine, request.startColumn, utf16, "start");
+            const size_t end = offsetOf(d, request.endLine, request.endColumn, utf16, "end");
             if (end < start) msg::raise(PyExc_ValueError, "the range ends before it starts");
-            const compat::CharsView chars = compat::strChars(spec.text);
+            const compat::CharsView chars = compat::strChars(request.text);
             const size_t n = static_cast<size_t>(chars.length);
             size_t added = 0;
             for (size_t i = 0; i < n; ++i) added += charOf(chars.data, chars.width, i) == '\n';
@@ -237,15 +237,15 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
     d.cache = py::check(PyObject_CallFunctionObjArgs(gImports.bodyCache, d.list.get(), nullptr));
 }
 
-py::Ref applyEdits(Document& d, const std::vector<EditSpec>& specs, bool utf16) {
+py::Ref applyEdits(Document& d, const std::vector<EditRequest>& requests, bool utf16) {
     BusyGuard busy(d);
     const EditStats before = d.stats;
     d.stats = EditStats();
-    d.stats.edits = specs.size();
+    d.stats.edits = requests.size();
     const Damage saved = d.damage;
     std::vector<Undo> undo;
     try {
-        applyToText(d, specs, utf16, undo);
+        applyToText(d, requests, utf16, undo);
     } catch (...) {
         d.stats = before;
         throw;
@@ -297,9 +297,9 @@ py::Ref setText(Document& d, PyObject* source) {
     py::Ref sc = py::check(compat::intFromSsize(head - d.rows.start(startRow, old)));
     py::Ref el = py::check(compat::intFromSsize(endRow + 1));
     py::Ref ec = py::check(compat::intFromSsize(old - tail - d.rows.start(endRow, old)));
-    std::vector<EditSpec> specs{{sl.get(), sc.get(), el.get(), ec.get(), middle.get()}};
-    if (head == old && head == n) specs.clear();
-    return applyEdits(d, specs, false);
+    std::vector<EditRequest> requests{{sl.get(), sc.get(), el.get(), ec.get(), middle.get()}};
+    if (head == old && head == n) requests.clear();
+    return applyEdits(d, requests, false);
 }
 
 }  // namespace sdoc
