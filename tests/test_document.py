@@ -406,8 +406,11 @@ class LeakTest(unittest.TestCase):
             doc.Edit(7, 16, 7, 18, '')
             doc.Edit(1, 0, 1, 0, '(')
             doc.Edit(1, 0, 1, 1, '')
+            doc.EditMany([(20, 0, 20, 0, piece + '\n'), (1, 0, 1, 0, piece)])
+            doc.EditMany([(1, 0, 1, 2, ''), (20, 0, 21, 0, '')])
             doc.GetOutline()
             doc.GetBodyOfScope('A#0')
+            doc.SelfCheck()
             try:
                 doc.Edit(99, 0, 99, 0, piece)
             except ValueError:
