@@ -8,7 +8,7 @@ import pickle
 import sys
 import unittest
 
-from support import PY3, Picklers, RunPython
+from support import PY3, CapturedStderr, Picklers, RunPython
 from docsupport import (CEditResult, CScopeDocument, ErrorFields, Fields, Fresh, Outline, Place,
                         kSample)
 
@@ -373,6 +373,15 @@ class HandEditedLogicalsTest(unittest.TestCase):
         with self.assertRaises(AssertionError) as caught:
             doc.SelfCheck()
         self.assertIn('elsewhere', str(caught.exception))
+
+
+    def testANameTheFinderRefusesLeavesTheWholeFileNamedAgain(self):
+        doc = CScopeDocument(kSample)
+        doc.GetLogicals()[5].fLocalScopeName = 5
+        with CapturedStderr():
+            self.assertRaises(TypeError, doc.Edit, 7, 16, 7, 16, 'y')
+        self.assertEqual(doc.GetLogicals()[5].fLocalScopeName, 'f#0')
+        doc.SelfCheck()
 
 
 class CheckEveryEditTest(unittest.TestCase):

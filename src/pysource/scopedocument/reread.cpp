@@ -239,6 +239,34 @@ void clearCache(Document& d, PyObject* changes) {
     }
 }
 
+// A new finder and cache, and the whole list named again; quietly leaves
+// things as they are when that fails too. (Dropping a name set from
+// outside may run its destructor; `busy` holds the document meanwhile.)
+void renameWhole(Document& d) noexcept {
+    // From no names at all: a name set from outside may be what failed.
+    PyObject* list = d.list.get();
+    for (Py_ssize_t i = 0; i < PyList_GET_SIZE(list); ++i) {
+        LogicalLineObject* l = record(PyList_GET_ITEM(list, i));
+        py::storeSlot(&l->fScopeName, nullptr);
+        py::storeSlot(&l->fLocalScopeName, nullptr);
+    }
+    PyObject* finder = PyObject_CallFunctionObjArgs(gImports.changeFinder, d.list.get(), nullptr);
+    PyObject* none = finder ? PyList_New(0) : nullptr;
+    PyObject* named = none ? PyObject_CallMethod(finder, const_cast<char*>("FindChanges"), const_cast<char*>("(OO)"),
+                                                 d.list.get(), none)
+                           : nullptr;
+    PyObject* cache = named ? PyObject_CallFunctionObjArgs(gImports.bodyCache, d.list.get(), nullptr) : nullptr;
+    if (cache != nullptr) {
+        d.finder = py::Ref::steal(finder);
+        d.cache = py::Ref::steal(cache);
+        finder = nullptr;
+    }
+    Py_XDECREF(finder);
+    Py_XDECREF(none);
+    Py_XDECREF(named);
+    PyErr_Clear();
+}
+
 template <class Char>
 py::Ref makeLogicals(const Scanner<Char>& scanner, const Char* text, Document& d) {
     const auto& records = scanner.records();
@@ -503,10 +531,17 @@ void rereadAs(Document& d, EditOutcome& out) {
     d.error.reset();
     d.damage = Damage();
 
-    py::Ref result = py::check(PyObject_CallMethod(d.finder.get(), const_cast<char*>("FindChanges"),
-                                                   const_cast<char*>("(OO)"), out.added.get(), out.removed.get()));
-    if (!PyTuple_Check(result.get()) || PyTuple_GET_SIZE(result.get()) != 3) {
-        msg::raise(PyExc_SystemError, "FindChanges did not answer three sets");
+    py::Ref result = py::Ref::steal(PyObject_CallMethod(d.finder.get(), const_cast<char*>("FindChanges"),
+                                                        const_cast<char*>("(OO)"), out.added.get(),
+                                                        out.removed.get()));
+    if (!result || !PyTuple_Check(result.get()) || PyTuple_GET_SIZE(result.get()) != 3) {
+        // The list has moved on: rather than names of no text, the names of
+        // a whole pass (a new finder and cache), and the error raised.
+        if (result) PyErr_SetString(PyExc_SystemError, "FindChanges did not answer three sets");
+        py::SavedError raised;
+        renameWhole(d);
+        raised.restore();
+        py::fail();
     }
     out.changes = std::move(result);
     d.stats.findChangesCalled = true;
