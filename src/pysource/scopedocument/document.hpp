@@ -23,6 +23,8 @@
 
 namespace sdoc {
 
+constexpr size_t kUnknownRow = static_cast<size_t>(-1);
+
 // A part of the current text that differs from the baseline's: current
 // characters [start, end) stand where the baseline had `baselineMiddle`.
 struct DamageRange {
@@ -34,6 +36,10 @@ struct DamageRange {
     // took out of the row table (INT64_MAX: none), and how many rows they took.
     int64_t droppedMinColumn = INT64_MAX;
     size_t rowsDropped = 0;
+    // The rows holding `start` and `end`, kept while they are known (an
+    // edit's own), else kUnknownRow: found again by search.
+    size_t startRow = kUnknownRow;
+    size_t endRow = kUnknownRow;
 };
 
 // Where the current text differs from the baseline's: ranges in text order,
@@ -121,9 +127,10 @@ PyTypeObject* documentType() noexcept;
 void readyDocumentType();
 
 // --- positions.cpp -----------------------------------------------------------------
-// The character offset of (lineno, column) in the current text; ValueError
-// for a place outside it. `utf16`: the column counts UTF-16 code units.
-size_t offsetOf(Document& d, PyObject* lineno, PyObject* column, bool utf16, const char* which);
+// The character offset of (lineno, column) in the current text, and its
+// 0-based row; ValueError for a place outside it. `utf16`: the column
+// counts UTF-16 code units.
+size_t offsetOf(Document& d, PyObject* lineno, PyObject* column, bool utf16, const char* which, size_t* row);
 // The 1-based row holding offset `at`.
 size_t rowOfOffset(const Document& d, size_t at);
 // Characters of row r (0-based) without its '\n'.

@@ -52,8 +52,8 @@ uint32_t charOf(const void* data, int width, size_t i) noexcept {
 // `data`, with the rows following; `restore` gives the states and columns
 // of the rows it puts in (an undo).
 void replaceText(Document& d, size_t start, size_t end, const void* data, int width, size_t n,
-                 const DroppedRows* restore) {
-    const size_t r0 = rowOfOffset(d, start) - 1;
+                 const DroppedRows* restore, size_t r0 = kUnknownRow) {
+    if (r0 == kUnknownRow) r0 = rowOfOffset(d, start) - 1;
     const size_t removed = newlinesIn(d.text, start, end);
     std::vector<size_t> starts;
     for (size_t i = 0; i < n; ++i) {
@@ -73,7 +73,7 @@ bool endsWithNewline(const TextStore& t) { return t.size() > 0 && t.at(t.size() 
 // stands before an edit that puts `n` characters there: the ranges it
 // meets or touches become one.
 void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlinesRemoved, size_t newlinesAdded,
-                  const DroppedRows& dropped) {
+                  const DroppedRows& dropped, size_t r0) {
     Damage& g = d.damage;
     if (!g.active()) {
         g.baselineRows = d.rows.count();
@@ -106,9 +106,20 @@ void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlin
     for (int16_t c : dropped.columns) {
         if (c >= 0) merged.droppedMinColumn = std::min<int64_t>(merged.droppedMinColumn, c);
     }
+    // The rows of an edit's own range are known; a range it joins is found
+    // again by search.
+    const long rowShift = static_cast<long>(newlinesAdded) - static_cast<long>(newlinesRemoved);
+    if (lo == hi) {
+        merged.startRow = r0;
+        merged.endRow = r0 + newlinesAdded;
+    }
     for (size_t k = hi; k < ranges.size(); ++k) {
         ranges[k].start = static_cast<size_t>(static_cast<long>(ranges[k].start) + shift);
         ranges[k].end = static_cast<size_t>(static_cast<long>(ranges[k].end) + shift);
+        if (ranges[k].startRow != kUnknownRow) {
+            ranges[k].startRow = static_cast<size_t>(static_cast<long>(ranges[k].startRow) + rowShift);
+            ranges[k].endRow = static_cast<size_t>(static_cast<long>(ranges[k].endRow) + rowShift);
+        }
     }
     ranges.erase(ranges.begin() + static_cast<std::ptrdiff_t>(lo), ranges.begin() + static_cast<std::ptrdiff_t>(hi));
     ranges.insert(ranges.begin() + static_cast<std::ptrdiff_t>(lo), std::move(merged));
@@ -136,8 +147,9 @@ void applyToText(Document& d, const std::vector<EditRequest>& requests, bool utf
     const Damage saved = d.damage;
     try {
         for (const EditRequest& request : requests) {
-            const size_t start = offsetOf(d, request.startLine, request.startColumn, utf16, "start");
-            const size_t end = offsetOf(d, request.endLine, request.endColumn, utf16, "end");
+            size_t r0 = 0, r1 = 0;
+            const size_t start = offsetOf(d, request.startLine, request.startColumn, utf16, "start", &r0);
+            const size_t end = offsetOf(d, request.endLine, request.endColumn, utf16, "end", &r1);
             if (end < start) msg::raise(PyExc_ValueError, "the range ends before it starts");
             const compat::CharsView chars = compat::strChars(request.text);
             const size_t n = static_cast<size_t>(chars.length);
@@ -145,14 +157,13 @@ void applyToText(Document& d, const std::vector<EditRequest>& requests, bool utf
             for (size_t i = 0; i < n; ++i) added += charOf(chars.data, chars.width, i) == '\n';
             Undo u{start, n, {}, {}};
             d.text.copyOut(start, end, u.removed);
-            const size_t removedNewlines = newlinesIn(d.text, start, end);
-            const size_t r0 = rowOfOffset(d, start) - 1;
+            const size_t removedNewlines = r1 - r0;
             for (size_t r = r0 + 1; r <= r0 + removedNewlines; ++r) {
                 u.rows.states.push_back(d.rows.state(r));
                 u.rows.columns.push_back(d.rows.column(r));
             }
-            extendDamage(d, start, end, n, removedNewlines, added, u.rows);
-            replaceText(d, start, end, chars.data, chars.width, n, nullptr);
+            extendDamage(d, start, end, n, removedNewlines, added, u.rows, r0);
+            replaceText(d, start, end, chars.data, chars.width, n, nullptr, r0);
             undo.push_back(std::move(u));
         }
     } catch (...) {

@@ -60,7 +60,7 @@ size_t rowOfOffset(const Document& d, size_t at) {
     return lo + 1;
 }
 
-size_t offsetOf(Document& d, PyObject* linenoArg, PyObject* columnArg, bool utf16, const char* which) {
+size_t offsetOf(Document& d, PyObject* linenoArg, PyObject* columnArg, bool utf16, const char* which, size_t* row) {
     const Py_ssize_t lineno = intArgument(linenoArg, which, "line");
     const Py_ssize_t column = intArgument(columnArg, which, "column");
     const Py_ssize_t count = static_cast<Py_ssize_t>(d.rows.count());
@@ -69,6 +69,7 @@ size_t offsetOf(Document& d, PyObject* linenoArg, PyObject* columnArg, bool utf1
         py::fail();
     }
     const size_t r = static_cast<size_t>(lineno - 1);
+    *row = r;
     const size_t start = d.rows.start(r, d.text.size());
     const size_t length = rowLength(d, r);
     if (column < 0) {

@@ -84,6 +84,26 @@ Py_ssize_t lowerBound(PyObject* list, Py_ssize_t lo, int64_t lineno) {
     return lo;
 }
 
+// The same when the index is likely near `lo`: the bounds double from there
+// (a group's old logicals are few, and their items are near each other).
+Py_ssize_t lowerBoundNear(PyObject* list, Py_ssize_t lo, int64_t lineno) {
+    const Py_ssize_t n = PyList_GET_SIZE(list);
+    Py_ssize_t step = 1;
+    Py_ssize_t hi = lo;
+    while (hi < n && record(PyList_GET_ITEM(list, hi))->fLineno < lineno) {
+        lo = hi + 1;
+        hi += step;
+        step *= 2;
+    }
+    hi = std::min(hi, n);
+    while (lo < hi) {
+        const Py_ssize_t mid = lo + (hi - lo) / 2;
+        if (record(PyList_GET_ITEM(list, mid))->fLineno < lineno) lo = mid + 1;
+        else hi = mid;
+    }
+    return lo;
+}
+
 // The indentation stack at the start of row r: the successive least columns
 // walking up from it (each row that ran the check left the stack as the
 // columns below its own, then its own). Rows from `unchangedAbove` on may
@@ -345,8 +365,9 @@ void rereadAs(Document& d, EditOutcome& out) {
     // rows are the baseline's, shifted).
     std::vector<size_t> startRow(rangeCount), afterRow(rangeCount);
     for (size_t k = 0; k < rangeCount; ++k) {
-        startRow[k] = rowOfOffset(d, ranges[k].start) - 1;
-        afterRow[k] = rowOfOffset(d, ranges[k].end);
+        const bool known = ranges[k].startRow != kUnknownRow;
+        startRow[k] = known ? ranges[k].startRow : rowOfOffset(d, ranges[k].start) - 1;
+        afterRow[k] = (known ? ranges[k].endRow : rowOfOffset(d, ranges[k].end) - 1) + 1;
     }
     auto cleanAbove = [&](size_t r) {
         while (r > 0 && unpack(d.rows.state(r)).midLogical()) --r;
@@ -464,7 +485,7 @@ void rereadAs(Document& d, EditOutcome& out) {
     Py_ssize_t from = 0;
     for (GroupRead& G : groups) {
         G.i0 = lowerBound(list, from, static_cast<int64_t>(G.first) - delta + 1);
-        G.i1 = G.converged ? lowerBound(list, G.i0, static_cast<int64_t>(G.end) - delta - G.lineDelta + 1)
+        G.i1 = G.converged ? lowerBoundNear(list, G.i0, static_cast<int64_t>(G.end) - delta - G.lineDelta + 1)
                            : PyList_GET_SIZE(list);
         requireInOrder(list, G.i0, G.i1);
         from = G.i1;
