@@ -116,7 +116,7 @@ class CMessageReader(object):
     @staticmethod
     def _Length(header):
         length = None
-        for line in header.split(b'\n'):
+        for line in header[:-1].split(b'\n'):  # the block ends with its last line's '\n'
             line = line.rstrip(b'\r')
             name, colon, value = line.partition(b':')
             if not colon or not name.strip():

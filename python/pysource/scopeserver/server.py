@@ -125,7 +125,7 @@ class CScopeServer(object):
             self._Invalid(msg_id if has_id else None, 'not a JSON-RPC 2.0 message')
             return
         params = msg.get('params')
-        if 'params' in msg and not isinstance(params, (dict, list)):
+        if params is not None and not isinstance(params, (dict, list)):
             if has_id:
                 self._send(protocol.ErrorResponse(msg_id, kInvalidParams, 'params is an object'))
             else:
