@@ -162,6 +162,7 @@ class OutlineTest(unittest.TestCase):
         self.Check(client)
         lines = kSample.split('\n')
         rng = random.Random(11)
+        readable = {True: 0, False: 0}
         for step in range(60):
             count = len(client.Text().split('\n'))
             line = rng.randrange(count - 1)
@@ -182,6 +183,17 @@ class OutlineTest(unittest.TestCase):
                 change = Change(line, col, line, col, '"""')
             client.Change([change])
             self.Check(client)
+            readable[lsp_support.Reads(client.Text())] += 1
+            if not lsp_support.Reads(client.Text()) and rng.random() < 0.9:
+                # Take back what broke the text (the docstring or bracket
+                # closed again), so that it reads as often as not.
+                start = change['range']['start']
+                added = change['text'].split('\n')
+                end_col = len(added[-1]) + (start['character'] if len(added) == 1 else 0)
+                client.Change([Change(start['line'], start['character'],
+                                      start['line'] + len(added) - 1, end_col, '')])
+                self.Check(client)
+        self.assertGreater(min(readable.values()), 10, readable)
         self.assertNotEqual(client.Text(), kSample)
         client.Change([{'text': '\n'.join(lines)}])
         self.Check(client)

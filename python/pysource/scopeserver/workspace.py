@@ -6,6 +6,11 @@ then, and so must its columns be: the symbols are kept as they were for
 the baseline. They usually are already (the client asked for them before
 the edit); when not, the edit that broke the text is undone, the symbols
 written, and the edit made again.
+
+The changes of one notification are one edit of the document (one
+EditMany), so the last text that read is always a version the client
+numbered. Their places are worked out in the text the changes before them
+leave, simulated over the document's lines (_CBatchLines).
 """
 
 from . import positions, symbols
@@ -24,6 +29,52 @@ class CChange(object):
 
 def _LineCountOf(text):
     return text.count('\n') + 1
+
+
+class _CBatchLines(object):
+    """The document's lines as the changes so far would leave them: pieces
+    that are either a (first, last) range of the document's lines or a list
+    of new lines."""
+
+    def __init__(self, doc):
+        self._doc = doc
+        self.count = doc.GetLineCount()
+        self._pieces = [(1, self.count)]
+
+    @staticmethod
+    def _Size(piece):
+        return piece[1] - piece[0] + 1 if isinstance(piece, tuple) else len(piece)
+
+    def Line(self, lineno):
+        for piece in self._pieces:
+            size = self._Size(piece)
+            if lineno <= size:
+                if isinstance(piece, tuple):
+                    return self._doc.GetLine(piece[0] + lineno - 1)
+                return piece[lineno - 1]
+            lineno -= size
+        raise IndexError(lineno)
+
+    def Replace(self, first, last, new_lines):
+        """Lines `first`..`last` become `new_lines`."""
+        heads, tails = [], []
+        before = 0
+        for piece in self._pieces:
+            size = self._Size(piece)
+            low, high = before + 1, before + size
+            before = high
+            if low < first:
+                heads.append(self._Part(piece, 0, min(high, first - 1) - low + 1))
+            if high > last:
+                tails.append(self._Part(piece, max(low, last + 1) - low, size))
+        self._pieces = [p for p in heads + [new_lines] + tails if self._Size(p)]
+        self.count += len(new_lines) - (last - first + 1)
+
+    @staticmethod
+    def _Part(piece, start, stop):
+        if isinstance(piece, tuple):
+            return piece[0] + start, piece[0] + stop - 1
+        return piece[start:stop]
 
 
 class COpenDocument(object):
@@ -59,70 +110,83 @@ class COpenDocument(object):
                 count = _LineCountOf(change.text)
 
     def Apply(self, changes, version):
-        """Applies checked changes in order."""
+        """Applies checked changes, in order, as one edit of the document:
+        when the text does not read after them, the last text that did is
+        the one before the notification, whatever the texts in between."""
         doc = self.doc
-        for n, change in enumerate(changes):
-            readable = doc.IsReadable()
-            kept = self._symbols.Current() if readable else None
-            edit = self._DocEdit(change)
-            undo = self._Undo(edit) if readable and kept is None else None
-            self._Edit(edit)
-            if readable and not doc.IsReadable():
-                if kept is None:
-                    # Back to the baseline for its symbols, then on again.
-                    self._Edit(undo)
-                    kept = self._symbols.Json(doc, doc.GetOutline())
-                    self._Edit(edit)
-                self._kept = kept
+        self.version = version
+        if not changes:
+            return
+        readable = doc.IsReadable()
+        kept = self._symbols.Current() if readable else None
+        edits, undos = self._DocEdits(changes, readable and kept is None)
+        self._EditAll(edits)
         if doc.IsReadable():
             self._kept = None
-        self.version = version
+        elif readable:
+            if kept is None:
+                # Back to the text that read for its symbols, then on again.
+                self._EditAll(undos)
+                kept = self._symbols.Json(doc, doc.GetOutline())
+                self._EditAll(edits)
+            self._kept = kept
 
-    def _DocEdit(self, change):
-        """(start line, start col, end line, end col, text) in the document's
-        terms, or (None, text) for a whole text."""
-        text = positions.ToDocumentText(change.text)
-        if change.start is None:
-            return None, text
-        return self._DocPlace(change.start) + self._DocPlace(change.end) + (text,)
+    def _DocEdits(self, changes, undo):
+        """The changes as the document's edits, each in the text the ones
+        before it leave, and (when `undo`) the edits that take them back."""
+        doc = self.doc
+        if len(changes) == 1 and changes[0].start is None:
+            text = positions.ToDocumentText(changes[0].text)
+            return [(None, text)], [(None, doc.GetText())] if undo else None
+        lines = _CBatchLines(doc)
+        edits, undos = [], []
+        for n, change in enumerate(changes):
+            text = positions.ToDocumentText(change.text)
+            if change.start is None:
+                start, end = (1, 0), (lines.count, len(lines.Line(lines.count)))
+            else:
+                start, end = self._DocPlace(lines, change.start), self._DocPlace(lines, change.end)
+            edits.append(start + end + (text,))
+            if undo or n < len(changes) - 1:
+                first, last = lines.Line(start[0]), lines.Line(end[0])
+                new = text.split('\n')
+                added_end = (start[0] + len(new) - 1,
+                             len(new[-1]) + (start[1] if len(new) == 1 else 0))
+                if undo:
+                    if start[0] == end[0]:
+                        old = first[start[1]:end[1]]
+                    else:
+                        old = '\n'.join([first[start[1]:]] +
+                                        [lines.Line(k) for k in range(start[0] + 1, end[0])] +
+                                        [last[:end[1]]])
+                    undos.append(start + added_end + (old,))
+                new[0] = first[:start[1]] + new[0]
+                new[-1] += last[end[1]:]
+                lines.Replace(start[0], end[0], new)
+        undos.reverse()
+        return edits, undos
 
-    def _DocPlace(self, place):
+    def _DocPlace(self, lines, place):
         line, character = place
-        count = self.doc.GetLineCount()
+        count = lines.count
         if line == count:  # just past the last line: the end of the text
-            return count, len(self.doc.GetLine(count))
-        content = positions.Content(self.doc.GetLine(line + 1), line + 1 == count)
+            return count, len(lines.Line(count))
+        content = positions.Content(lines.Line(line + 1), line + 1 == count)
         return line + 1, positions.DocColumn(content, character, self.encoding)
 
-    def _Undo(self, edit):
-        """The edit that takes `edit` back (made before it is applied)."""
+    def _EditAll(self, edits):
         doc = self.doc
-        if edit[0] is None:
-            return None, doc.GetText()
-        start_line, start_col, end_line, end_col, text = edit
-        if start_line == end_line:
-            old = doc.GetLine(start_line)[start_col:end_col]
-        else:
-            lines = [doc.GetLine(start_line)[start_col:]]
-            lines.extend(doc.GetLine(n) for n in range(start_line + 1, end_line))
-            lines.append(doc.GetLine(end_line)[:end_col])
-            old = '\n'.join(lines)
-        last = text.rfind('\n')
-        if last < 0:
-            new_end = start_line, start_col + len(text)
-        else:
-            new_end = start_line + text.count('\n'), len(text) - last - 1
-        return (start_line, start_col) + new_end + (old,)
-
-    def _Edit(self, edit):
-        doc = self.doc
-        if edit[0] is None:
+        if edits[0][0] is None:
             old_count = doc.GetLineCount()
-            doc.SetText(edit[1])
+            doc.SetText(edits[0][1])
             self._symbols.NoteEdit(1, old_count, doc.GetLineCount())
         else:
-            doc.Edit(*edit)
-            self._symbols.NoteEdit(edit[0], edit[2], edit[4].count('\n') + 1)
+            if len(edits) == 1:
+                doc.Edit(*edits[0])
+            else:
+                doc.EditMany(edits)
+            for edit in edits:
+                self._symbols.NoteEdit(edit[0], edit[2], edit[4].count('\n') + 1)
         self._outline = None
 
     # --- Answers -----------------------------------------------------------------
