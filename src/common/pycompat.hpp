@@ -673,4 +673,47 @@ inline void DictWatch::mark(PyObject*, PyObject*) noexcept {
 
 #endif
 
+// --- Text as characters --------------------------------------------------------
+
+// The characters of a str as an array: 3.x by the str's kind (1, 2 or 4
+// bytes a code point), 2.7 as its bytes (1). Lives as long as the str.
+struct CharsView {
+    const void* data;
+    int width;  // bytes a character
+    Py_ssize_t length;
+};
+
+inline CharsView strChars(PyObject* s) {
+#if PY_MAJOR_VERSION >= 3
+#if PY_VERSION_HEX < 0x030C0000
+    if (PyUnicode_READY(s) < 0) py::fail();
+#endif
+    return {PyUnicode_DATA(s), static_cast<int>(PyUnicode_KIND(s)), PyUnicode_GET_LENGTH(s)};
+#else
+    return {PyString_AS_STRING(s), 1, PyString_GET_SIZE(s)};
+#endif
+}
+
+// A new str of `n` characters of `width` bytes each (code points on 3.x,
+// bytes on 2.7); null with an exception set.
+inline PyObject* strFromChars(const void* data, int width, Py_ssize_t n) noexcept {
+#if PY_MAJOR_VERSION >= 3
+    return PyUnicode_FromKindAndData(width, data, n);
+#else
+    if (width == 1) return PyString_FromStringAndSize(static_cast<const char*>(data), n);
+    // Wider characters on 2.7 are bytes kept in wider slots.
+    PyObject* s = PyString_FromStringAndSize(nullptr, n);
+    if (s == nullptr) return nullptr;
+    char* out = PyString_AS_STRING(s);
+    for (Py_ssize_t i = 0; i < n; ++i) {
+        out[i] = static_cast<char>(width == 2 ? static_cast<const uint16_t*>(data)[i]
+                                              : static_cast<const uint32_t*>(data)[i]);
+    }
+    return s;
+#endif
+}
+
+// What a column of a text counts: code points on 3.x, bytes on 2.7.
+inline constexpr const char* kColumnUnit = kPython3 ? "code points" : "bytes";
+
 }  // namespace compat

@@ -1,0 +1,155 @@
+// CScopeDocument: a text, the logicals it reads into, and their scope names,
+// kept up to date edit by edit.
+//
+// What holds between calls:
+// - `text` is the current text; `rows` has one row per physical line of it.
+// - When `readable`, `list` holds the logicals of `text` in order, each
+//   carrying its current line number and the names a whole-file pass
+//   gives; `finder` and `cache` work on that list.
+// - When not, `list` is the baseline: the logicals of the last text that
+//   read, in that text's line numbers, with their names. `damage` tells
+//   where the current text differs from the baseline's.
+// - `list` never leaves the document: callers get copies, so the only
+//   way it changes is an edit here (`version` counts them).
+#pragma once
+
+#include "common/pyref.hpp"
+#include "pysource/scopedocument/text_store.hpp"
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace sdoc {
+
+// The part of the current text that differs from the baseline's: current
+// characters [start, end) stand where the baseline had `baselineMiddle`.
+struct Damage {
+    bool active = false;
+    size_t start = 0;
+    size_t end = 0;
+    std::vector<uint32_t> baselineMiddle;
+    long lineDelta = 0;       // current rows minus baseline rows
+    size_t baselineRows = 0;  // rows of the baseline text
+    bool baselineEndsWithNewline = false;
+};
+
+struct EditStats {
+    size_t rowsScanned = 0;
+    size_t logicalsMade = 0;
+    size_t logicalsRemoved = 0;
+    size_t logicalsShifted = 0;
+    size_t edits = 0;
+    bool findChangesCalled = false;
+    bool wholeRead = false;
+};
+
+struct Document {
+    TextStore text;
+    RowTable rows;
+    py::Ref filename;
+    py::Ref list;
+    py::Ref finder;
+    py::Ref cache;
+    py::Ref error;      // the reader's exception when the text does not read
+    py::Ref textCache;  // the whole text as a str, until the next edit
+    bool readable = false;
+    bool busy = false;
+    uint64_t version = 0;
+    Damage damage;
+    EditStats stats;
+};
+
+struct DocumentObject {
+    PyObject_HEAD
+    Document* doc;
+    PyObject* weakrefs;
+};
+
+inline Document& documentOf(PyObject* self) noexcept {
+    return *reinterpret_cast<DocumentObject*>(self)->doc;
+}
+
+// One text edit as the caller gave it, validated: characters [start, end)
+// of the text as it stands before this edit are replaced by `text`.
+struct TextEdit {
+    size_t start = 0;
+    size_t end = 0;
+    py::Ref text;
+};
+
+// --- document_type.cpp -----------------------------------------------------------
+PyTypeObject* documentType() noexcept;
+void readyDocumentType();
+
+// --- positions.cpp -----------------------------------------------------------------
+// The character offset of (lineno, column) in the current text; ValueError
+// for a place outside it. `utf16`: the column counts UTF-16 code units.
+size_t offsetOf(Document& d, PyObject* lineno, PyObject* column, bool utf16, const char* which);
+// The 1-based row holding offset `at`.
+size_t rowOfOffset(const Document& d, size_t at);
+// Characters of row r (0-based) without its '\n'.
+size_t rowLength(const Document& d, size_t r);
+// The text an edit puts in: the interpreter's str; TypeError otherwise.
+void requireEditText(PyObject* text);
+
+// --- edit_engine.cpp -----------------------------------------------------------------
+// Reads `source` into a fresh document state (text, rows, logicals, names).
+void openDocument(Document& d, PyObject* source, PyObject* filename);
+// One edit as the caller gave it (borrowed; the caller holds them).
+struct EditSpec {
+    PyObject* startLine;
+    PyObject* startColumn;
+    PyObject* endLine;
+    PyObject* endColumn;
+    PyObject* text;
+};
+// Applies the edits in order, each in the coordinates the ones before it
+// left, as one change; returns the CEditResult. A bad edit changes nothing.
+py::Ref applyEdits(Document& d, const std::vector<EditSpec>& specs, bool utf16);
+// A whole new text as one edit.
+py::Ref setText(Document& d, PyObject* source);
+// The current text as a str (cached until the next edit).
+PyObject* wholeText(Document& d);
+// Whether SBC_CHECK_DOCUMENT asks for a self-check after every edit.
+extern bool gCheckEveryEdit;
+
+// --- queries.cpp -----------------------------------------------------------------------
+py::Ref getLine(Document& d, PyObject* lineno);
+py::Ref scopeAtLine(Document& d, PyObject* lineno);
+py::Ref outline(Document& d);
+py::Ref logicalsCopy(Document& d);
+
+// --- pickling.cpp ------------------------------------------------------------------------
+py::Ref reduceDocument(PyObject* self, Document& d);
+void restoreDocument(PyObject* self, PyObject* state);
+
+// --- self_check.cpp ---------------------------------------------------------------------
+void selfCheck(Document& d);
+
+// --- edit_result.cpp ---------------------------------------------------------------------
+struct EditOutcome {
+    py::Ref added, removed;
+    py::Ref changes;  // FindChanges' (contents, class, function), or null
+    size_t regionFirstLine = 1, regionOldLines = 0, regionNewLines = 0;
+};
+PyTypeObject* editResultType() noexcept;
+void readyEditResultType();
+py::Ref makeEditResult(Document& d, EditOutcome& outcome);
+
+// --- imports.cpp -------------------------------------------------------------------------
+// What the document uses of the other modules, bound at import.
+struct Imports {
+    PyObject* readLogicals;     // pysource.logicals.ReadLogicals
+    PyObject* decodeSource;     // pysource.logicals._SourceText (3.x bytes)
+    PyObject* changeFinder;     // pysource.scopebodycache.CChangeFinder
+    PyObject* bodyCache;        // pysource.scopebodycache.CScopeBodyCache
+    PyObject* fullName;         // pysource.scopebodycache.GetFullNameForScopeDef
+    PyTypeObject* logicalType;  // pysource._fastaccess.LogicalLineType
+    PyObject* emptyName;        // ""
+    PyObject* syntaxError;      // SyntaxError
+};
+extern Imports gImports;
+void bindImports();
+
+}  // namespace sdoc

@@ -1,0 +1,381 @@
+// Edits: the text changes, the logicals follow it, and one FindChanges call
+// names what changed.
+//
+// A batch of edits is applied to the text in order; every edit is checked
+// against the text the ones before it left, and a bad one undoes them all.
+// The span the batch touched (with what the baseline held there) is the
+// damage. The text is then read: when it reads, the logicals that differ
+// from the list's replace them (the same objects stay for the rest, with
+// their line numbers shifted), FindChanges names them and the cache forgets
+// the changed scopes; when it does not, the list stays as the baseline and
+// the damage stays for the next edit.
+//
+// Python code runs here only in the reader, the finder and the cache (all
+// of them the project's own, on the document's private list) and in the
+// destructors of the logicals dropped; `busy` refuses a call that comes
+// back into the document meanwhile.
+#include "common/messages.hpp"
+#include "common/pycompat.hpp"
+#include "pysource/contracts/logical_record.hpp"
+#include "pysource/scopedocument/document.hpp"
+
+#include <algorithm>
+
+namespace sdoc {
+
+using contracts::LogicalLineObject;
+
+bool gCheckEveryEdit = false;
+
+namespace {
+
+LogicalLineObject* record(PyObject* o) noexcept { return reinterpret_cast<LogicalLineObject*>(o); }
+
+bool sameSignature(PyObject* a, PyObject* b) noexcept {
+    const LogicalLineObject* x = record(a);
+    const LogicalLineObject* y = record(b);
+    if (x->fKind != y->fKind || x->fIndent != y->fIndent || x->fTokenCount != y->fTokenCount) return false;
+    for (Py_ssize_t i = 0; i < x->fTokenCount; ++i) {
+        if (!compat::strEqual(x->fTokens[i], y->fTokens[i])) return false;
+    }
+    return true;
+}
+
+// The number of '\n' among characters [start, end).
+size_t newlinesIn(const TextStore& t, size_t start, size_t end) {
+    size_t n = 0;
+    for (size_t at = t.findNewline(start); at < end; at = t.findNewline(at + 1)) ++n;
+    return n;
+}
+
+// Characters [start, end) of the text replaced by the `n` characters at
+// `data`, with the rows following.
+void replaceText(Document& d, size_t start, size_t end, const void* data, int width, size_t n) {
+    const size_t r0 = rowOfOffset(d, start) - 1;
+    const size_t removed = newlinesIn(d.text, start, end);
+    std::vector<size_t> starts;
+    for (size_t i = 0; i < n; ++i) {
+        uint32_t c;
+        switch (width) {
+        case 1: c = static_cast<const uint8_t*>(data)[i]; break;
+        case 2: c = static_cast<const uint16_t*>(data)[i]; break;
+        default: c = static_cast<const uint32_t*>(data)[i]; break;
+        }
+        if (c == '\n') starts.push_back(start + i + 1);
+    }
+    const size_t oldSize = d.text.size();
+    const size_t newSize = oldSize - (end - start) + n;
+    d.rows.replace(r0, removed, starts, newSize, oldSize);
+    d.text.replace(start, end, data, width, n);
+    d.textCache.reset();
+}
+
+bool endsWithNewline(const TextStore& t) { return t.size() > 0 && t.at(t.size() - 1) == '\n'; }
+
+// Widens the damage to cover characters [start, end) of the text as it
+// stands before an edit that puts `n` characters there.
+void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlinesRemoved, size_t newlinesAdded) {
+    Damage& g = d.damage;
+    if (!g.active) {
+        g.active = true;
+        g.start = start;
+        g.end = end;
+        g.baselineMiddle.clear();
+        d.text.copyOut(start, end, g.baselineMiddle);
+        g.lineDelta = 0;
+        g.baselineRows = d.rows.count();
+        g.baselineEndsWithNewline = endsWithNewline(d.text);
+    } else {
+        if (start < g.start) {
+            std::vector<uint32_t> head;
+            d.text.copyOut(start, g.start, head);
+            g.baselineMiddle.insert(g.baselineMiddle.begin(), head.begin(), head.end());
+            g.start = start;
+        }
+        if (end > g.end) {
+            d.text.copyOut(g.end, end, g.baselineMiddle);
+            g.end = end;
+        }
+    }
+    g.end = g.end + n - (end - start);
+    g.lineDelta += static_cast<long>(newlinesAdded) - static_cast<long>(newlinesRemoved);
+}
+
+struct Undo {
+    size_t start;
+    size_t length;  // of the text put in
+    std::vector<uint32_t> removed;
+};
+
+// Applies the batch to the text; on a bad edit restores text, rows and
+// damage and rethrows.
+void applyToText(Document& d, std::vector<TextEdit>& edits, const std::vector<EditSpec>& specs, bool utf16) {
+    std::vector<Undo> undo;
+    const Damage saved = d.damage;
+    try {
+        for (const EditSpec& spec : specs) {
+            const size_t start = offsetOf(d, spec.startLine, spec.startColumn, utf16, "start");
+            const size_t end = offsetOf(d, spec.endLine, spec.endColumn, utf16, "end");
+            if (end < start) msg::raise(PyExc_ValueError, "the range ends before it starts");
+            const compat::CharsView chars = compat::strChars(spec.text);
+            const size_t n = static_cast<size_t>(chars.length);
+            size_t added = 0;
+            for (size_t i = 0; i < n; ++i) {
+                uint32_t c = chars.width == 1   ? static_cast<const uint8_t*>(chars.data)[i]
+                             : chars.width == 2 ? static_cast<const uint16_t*>(chars.data)[i]
+                                                : static_cast<const uint32_t*>(chars.data)[i];
+                added += c == '\n';
+            }
+            Undo u{start, n, {}};
+            d.text.copyOut(start, end, u.removed);
+            extendDamage(d, start, end, n, newlinesIn(d.text, start, end), added);
+            replaceText(d, start, end, chars.data, chars.width, n);
+            undo.push_back(std::move(u));
+            TextEdit e;
+            e.start = start;
+            e.end = end;
+            e.text = py::Ref::own(spec.text);
+            edits.push_back(std::move(e));
+        }
+    } catch (...) {
+        for (size_t k = undo.size(); k-- > 0;) {
+            const Undo& u = undo[k];
+            replaceText(d, u.start, u.start + u.length, u.removed.data(), 4, u.removed.size());
+        }
+        d.damage = saved;
+        throw;
+    }
+}
+
+py::Ref callReader(Document& d) {
+    PyObject* text = wholeText(d);
+    return py::Ref::steal(PyObject_CallFunctionObjArgs(gImports.readLogicals, text, d.filename.get(), nullptr));
+}
+
+// The pending SyntaxError as the document's error; false (the exception
+// still set) for any other failure.
+bool takeSyntaxError(Document& d) {
+    if (!PyErr_ExceptionMatches(PyExc_SyntaxError)) return false;
+    PyObject *type, *value, *tb;
+    PyErr_Fetch(&type, &value, &tb);
+    PyErr_NormalizeException(&type, &value, &tb);
+    py::Ref keepType = py::Ref::steal(type);
+    py::Ref keepTb = py::Ref::steal(tb);
+    d.error = py::Ref::steal(value);
+    d.readable = false;
+    return true;
+}
+
+
+// Brings the list to `fresh` (the logicals of the current text): the common
+// prefix (same tokens, kind, indent, line) and suffix (same tokens, kind,
+// indent; line numbers taken from `fresh`) stay as they are.
+void followFresh(Document& d, PyObject* fresh, EditOutcome& out) {
+    PyObject* list = d.list.get();
+    const Py_ssize_t oldN = PyList_GET_SIZE(list);
+    const Py_ssize_t newN = PyList_GET_SIZE(fresh);
+    const Py_ssize_t limit = std::min(oldN, newN);
+    Py_ssize_t head = 0;
+    while (head < limit) {
+        PyObject* a = PyList_GET_ITEM(list, head);
+        PyObject* b = PyList_GET_ITEM(fresh, head);
+        if (record(a)->fLineno != record(b)->fLineno || !sameSignature(a, b)) break;
+        ++head;
+    }
+    Py_ssize_t tail = 0;
+    while (tail < limit - head &&
+           sameSignature(PyList_GET_ITEM(list, oldN - 1 - tail), PyList_GET_ITEM(fresh, newN - 1 - tail))) {
+        ++tail;
+    }
+    for (Py_ssize_t k = 1; k <= tail; ++k) {
+        record(PyList_GET_ITEM(list, oldN - k))->fLineno = record(PyList_GET_ITEM(fresh, newN - k))->fLineno;
+    }
+    out.removed = py::check(PyList_GetSlice(list, head, oldN - tail));
+    out.added = py::check(PyList_GetSlice(fresh, head, newN - tail));
+    py::checkStatus(PyList_SetSlice(list, head, oldN - tail, out.added.get()));
+    d.stats.logicalsShifted = static_cast<size_t>(tail);
+    d.stats.logicalsRemoved = static_cast<size_t>(oldN - tail - head);
+}
+
+void clearCache(Document& d, PyObject* changes) {
+    for (Py_ssize_t k = 0; k < 3; ++k) {
+        PyObject* set = PyTuple_GET_ITEM(changes, k);
+        if (PySet_GET_SIZE(set) == 0) continue;
+        py::check(PyObject_CallMethod(d.cache.get(), const_cast<char*>("Clear"), const_cast<char*>("(O)"), set));
+    }
+}
+
+void findChanges(Document& d, EditOutcome& out) {
+    py::Ref result = py::check(PyObject_CallMethod(d.finder.get(), const_cast<char*>("FindChanges"),
+                                                   const_cast<char*>("(OO)"), out.added.get(), out.removed.get()));
+    if (!PyTuple_Check(result.get()) || PyTuple_GET_SIZE(result.get()) != 3) {
+        msg::raise(PyExc_SystemError, "FindChanges did not answer three sets");
+    }
+    out.changes = std::move(result);
+    d.stats.findChangesCalled = true;
+    clearCache(d, out.changes.get());
+}
+
+// Reads the current text into the document's state after the text changed.
+void follow(Document& d, EditOutcome& out) {
+    const size_t oldRows = d.damage.baselineRows;
+    py::Ref fresh = callReader(d);
+    d.stats.wholeRead = true;
+    d.stats.rowsScanned = d.rows.count();
+    out.regionFirstLine = 1;
+    out.regionOldLines = oldRows;
+    out.regionNewLines = d.rows.count();
+    if (!fresh) {
+        if (!takeSyntaxError(d)) py::fail();
+        out.added = py::check(PyList_New(0));
+        out.removed = py::check(PyList_New(0));
+        return;
+    }
+    if (!PyList_CheckExact(fresh.get())) msg::raise(PyExc_SystemError, "ReadLogicals did not answer a list");
+    d.stats.logicalsMade = static_cast<size_t>(PyList_GET_SIZE(fresh.get()));
+    followFresh(d, fresh.get(), out);
+    d.readable = true;
+    d.error.reset();
+    d.damage = Damage();
+    findChanges(d, out);
+}
+
+// The source as the document keeps it: the interpreter's str.
+py::Ref sourceText(PyObject* source, PyObject* filename) {
+    if (compat::kPython3) {
+        if (compat::isStr(source)) return py::Ref::own(source);
+        if (PyBytes_Check(source) || PyByteArray_Check(source)) {
+            py::Ref decoded = py::check(
+                PyObject_CallFunctionObjArgs(gImports.decodeSource, source, filename, nullptr));
+            // The decoding drops a UTF-8 BOM; the document keeps it, as
+            // it keeps one in a str.
+            const char* bytes = PyBytes_Check(source) ? PyBytes_AS_STRING(source) : PyByteArray_AS_STRING(source);
+            const Py_ssize_t size = PyBytes_Check(source) ? PyBytes_GET_SIZE(source) : PyByteArray_GET_SIZE(source);
+            if (size >= 3 && std::memcmp(bytes, "\xef\xbb\xbf", 3) == 0) {
+                py::Ref bom = py::check(compat::strFromText("\xef\xbb\xbf"));
+                return py::check(PyNumber_Add(bom.get(), decoded.get()));
+            }
+            return decoded;
+        }
+        PyErr_Format(PyExc_TypeError, "source must be str or bytes, not %.200s", Py_TYPE(source)->tp_name);
+        py::fail();
+    }
+    if (compat::isStr(source)) return py::Ref::own(source);
+    if (compat::isOtherText(source)) return py::check(PyUnicode_AsUTF8String(source));
+    PyErr_Format(PyExc_TypeError, "source must be str or unicode, not %.200s", Py_TYPE(source)->tp_name);
+    py::fail();
+}
+
+py::Ref finishEdit(Document& d, EditOutcome& out) {
+    ++d.version;
+    py::Ref result = makeEditResult(d, out);
+    if (gCheckEveryEdit) selfCheck(d);
+    return result;
+}
+
+class BusyGuard {
+public:
+    explicit BusyGuard(Document& d) : d_(d) {
+        if (d.busy) msg::raise(PyExc_RuntimeError, "the document is being edited (a call came back into it)");
+        d.busy = true;
+    }
+    ~BusyGuard() { d_.busy = false; }
+
+private:
+    Document& d_;
+};
+
+}  // namespace
+
+PyObject* wholeText(Document& d) {
+    if (!d.textCache) d.textCache = py::Ref::steal(d.text.slice(0, d.text.size()));
+    return d.textCache.get();
+}
+
+void openDocument(Document& d, PyObject* source, PyObject* filename) {
+    BusyGuard busy(d);
+    py::Ref text = sourceText(source, filename);
+    const compat::CharsView chars = compat::strChars(text.get());
+    d.text.assign(chars.data, chars.width, static_cast<size_t>(chars.length));
+    d.rows.assign(d.text);
+    d.textCache.reset();
+    d.filename = py::Ref::own(filename);
+    d.list = py::check(PyList_New(0));
+    d.error.reset();
+    d.damage = Damage();
+    d.stats = EditStats();
+    d.version = 0;
+    py::Ref fresh = callReader(d);
+    d.stats.wholeRead = true;
+    d.stats.rowsScanned = d.rows.count();
+    if (fresh) {
+        d.stats.logicalsMade = static_cast<size_t>(PyList_GET_SIZE(fresh.get()));
+        py::checkStatus(PyList_SetSlice(d.list.get(), 0, 0, fresh.get()));
+        d.readable = true;
+    } else {
+        if (!takeSyntaxError(d)) py::fail();
+        // The baseline is the empty text.
+        d.damage.active = true;
+        d.damage.start = 0;
+        d.damage.end = d.text.size();
+        d.damage.lineDelta = static_cast<long>(d.rows.count()) - 1;
+        d.damage.baselineRows = 1;
+        d.damage.baselineEndsWithNewline = false;
+    }
+    d.finder = py::check(PyObject_CallFunctionObjArgs(gImports.changeFinder, d.list.get(), nullptr));
+    py::Ref none = py::check(PyList_New(0));
+    py::Ref whole = py::check(PyObject_CallMethod(d.finder.get(), const_cast<char*>("FindChanges"),
+                                                  const_cast<char*>("(OO)"), d.list.get(), none.get()));
+    d.stats.findChangesCalled = true;
+    d.cache = py::check(PyObject_CallFunctionObjArgs(gImports.bodyCache, d.list.get(), nullptr));
+}
+
+py::Ref applyEdits(Document& d, const std::vector<EditSpec>& specs, bool utf16) {
+    BusyGuard busy(d);
+    d.stats = EditStats();
+    d.stats.edits = specs.size();
+    std::vector<TextEdit> edits;
+    applyToText(d, edits, specs, utf16);
+    EditOutcome out;
+    if (edits.empty()) {
+        out.added = py::check(PyList_New(0));
+        out.removed = py::check(PyList_New(0));
+        out.regionFirstLine = 1;
+        return finishEdit(d, out);
+    }
+    follow(d, out);
+    return finishEdit(d, out);
+}
+
+py::Ref setText(Document& d, PyObject* source) {
+    requireEditText(source);
+    const compat::CharsView chars = compat::strChars(source);
+    const size_t n = static_cast<size_t>(chars.length);
+    auto charAt = [&](size_t i) -> uint32_t {
+        switch (chars.width) {
+        case 1: return static_cast<const uint8_t*>(chars.data)[i];
+        case 2: return static_cast<const uint16_t*>(chars.data)[i];
+        default: return static_cast<const uint32_t*>(chars.data)[i];
+        }
+    };
+    const size_t old = d.text.size();
+    const size_t limit = std::min(old, n);
+    size_t head = 0;
+    while (head < limit && d.text.at(head) == charAt(head)) ++head;
+    size_t tail = 0;
+    while (tail < limit - head && d.text.at(old - 1 - tail) == charAt(n - 1 - tail)) ++tail;
+    // The one edit, in lines and columns of the current text.
+    const size_t startRow = rowOfOffset(d, head) - 1;
+    const size_t endRow = rowOfOffset(d, old - tail) - 1;
+    py::Ref middle = py::check(compat::strFromChars(
+        static_cast<const uint8_t*>(chars.data) + head * chars.width, chars.width, n - tail - head));
+    py::Ref sl = py::check(compat::intFromSsize(startRow + 1));
+    py::Ref sc = py::check(compat::intFromSsize(head - d.rows.start(startRow, old)));
+    py::Ref el = py::check(compat::intFromSsize(endRow + 1));
+    py::Ref ec = py::check(compat::intFromSsize(old - tail - d.rows.start(endRow, old)));
+    std::vector<EditSpec> specs{{sl.get(), sc.get(), el.get(), ec.get(), middle.get()}};
+    if (head == old && head == n) specs.clear();
+    return applyEdits(d, specs, false);
+}
+
+}  // namespace sdoc
