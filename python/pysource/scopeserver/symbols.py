@@ -2,10 +2,12 @@
 and its folding ranges, written straight as JSON text.
 
 An outline of a large file is thousands of symbols, and a keystroke changes
-one or two of them. So each symbol's JSON is kept as a piece, and after an
-edit only the pieces whose lines were edited are written again, when the
-outline itself (names, kinds, header and end lines) is unchanged; anything
-else writes every piece again.
+one or two of them. So each symbol's JSON is kept as a piece: after an edit
+that leaves the outline (names, kinds, header and end lines) as it was,
+only the pieces that read an edited line are written again; after any
+other, the symbols before and after the edited lines keep their columns
+and take their new line numbers, and only those between are worked out
+from their lines again.
 """
 
 import json
@@ -23,7 +25,8 @@ kSymbolClass = 5
 kSymbolMethod = 6
 kSymbolFunction = 12
 
-# Edited lines remembered between two builds; beyond this, all are written again.
+# Edited lines between two answers beyond which the symbols are matched up
+# rather than looked up by line.
 kMaxDirtyLines = 256
 # How many lines after the header's first the name is looked for (a header
 # continued by a backslash before its name).
@@ -32,7 +35,8 @@ kNameSearchLines = 8
 _kFlags = 0 if _kPy2 else re.UNICODE
 _kNameOnLine = re.compile(r'\b(?:def|class)[ \t\f]+(\w+)', _kFlags)
 _kNameAcrossLines = re.compile(r'\b(?:def|class)(?:[ \t\f]|\\\r?\n)+(\w+)', _kFlags)
-_kClosers = [']}' * n for n in range(64)]
+# What comes before a symbol that closes n symbols before it (shared strings).
+_kPrefixes = [''] + [']}' * n + ',' for n in range(1, 64)]
 
 
 def BareName(scoped_name):
@@ -66,134 +70,204 @@ def _NamePlace(doc, header_line, end_line, name, header):
 
 
 class COutlineJson(object):
-    """The JSON text of one document's symbols, kept piece by piece."""
+    """The JSON text of one document's symbols, kept piece by piece.
+
+    Between two builds the edits are summed up as the lines they left alone:
+    the first `_same_top` lines of the text and its last `_same_bottom`
+    lines are what they were at the build (the bottom ones shifted by the
+    change in the line count). Each symbol's piece is a template holding
+    its columns, filled with its line numbers: a symbol whose lines are all
+    in the untouched parts keeps its template and only takes its new line
+    numbers.
+    """
 
     def __init__(self, encoding):
         self._encoding = encoding
         self._outline = None
-        self._pieces = []      # per symbol: what comes before it, then its own fields
-        self._prefixes = []
-        self._deps = []        # per symbol: the lines its piece reads
-        self._in_class = []    # per symbol: whether its parent is a class
-        self._by_line = {}     # line -> indexes of the symbols that read it
+        self._count = 0         # the line count at the build, then after each edit
+        self._built_count = 0
+        self._same_top = 0
+        self._same_bottom = 0
+        self._templates = []    # per symbol: (template, name line - header line)
+        self._prefixes = []     # per symbol: what closes the symbols before it
+        self._in_class = []     # per symbol: whether its parent is a class
+        self._pieces = []
+        self._by_line = None    # line -> symbols whose piece reads it (made when needed)
         self._tail = ''
-        self._dirty = None     # lines edited since the build (current numbering); None: all
-        self._json = None
-        self.stats = dict(built=0, rewritten=0)
+        self._fresh = False     # no edit since the pieces were made
+        self.stats = dict(built=0, aligned=0, rewritten=0)
 
     def NoteEdit(self, first, last, new_count):
         """Lines `first`..`last` (numbered as before the edit) were replaced
         by `new_count` lines."""
-        self._json = None
-        dirty = self._dirty
-        if dirty is None:
-            return
-        delta = new_count - (last - first + 1)
-        moved = set(range(first, first + new_count))
-        for line in dirty:
-            if line < first:
-                moved.add(line)
-            elif line > last:
-                moved.add(line + delta)
-        self._dirty = moved if len(moved) <= kMaxDirtyLines else None
+        self._fresh = False
+        self._count += new_count - (last - first + 1)
+        self._same_top = min(self._same_top, first - 1)
+        self._same_bottom = min(self._same_bottom, self._count - (first + new_count - 1))
 
     def Current(self):
-        """The JSON of the last build when no edit came since, else None."""
-        return self._json
+        """The JSON of the last answer when no edit came since, else None."""
+        return self._Joined() if self._fresh else None
+
+    def _Joined(self):
+        return '[' + ''.join(self._pieces) + self._tail + ']'
 
     def Json(self, doc, outline):
         """The symbols of `outline` (doc.GetOutline() of a text that reads)."""
-        if self._json is not None:
-            return self._json
-        if self._dirty is not None and outline == self._outline:
-            self._Rewrite(doc, outline)
-        else:
-            self._Build(doc, outline)
-        self._dirty = set()
-        self._json = '[' + ''.join(self._pieces) + self._tail + ']'
-        return self._json
-
-    def _Rewrite(self, doc, outline):
-        redo = set()
-        by_line = self._by_line
-        for line in self._dirty:
-            redo.update(by_line.get(line, ()))
+        if self._fresh:
+            return self._Joined()
         count = doc.GetLineCount()
+        if self._outline is None or count != self._count:
+            self._Build(doc, outline, count, None)
+        elif count == self._built_count and outline == self._outline and \
+                count - self._same_bottom - self._same_top <= kMaxDirtyLines:
+            self._Rewrite(doc, outline, count)
+        else:
+            self._Build(doc, outline, count, self._Reusable(outline, count))
+        self._same_top = self._same_bottom = self._built_count = self._count = count
+        self._fresh = True
+        return self._Joined()
+
+    def _Rewrite(self, doc, outline, count):
+        """The outline and the line count are as built: only the symbols
+        that read an edited line are written again."""
+        if self._by_line is None:
+            self._by_line = by_line = {}
+            for i, (name, kind, header, end) in enumerate(outline):
+                for line in range(header, header + self._templates[i][1] + 1):
+                    by_line.setdefault(line, []).append(i)
+                if end > header + self._templates[i][1]:
+                    by_line.setdefault(end, []).append(i)
+        redo = set()
+        for line in range(self._same_top + 1, count - self._same_bottom + 1):
+            redo.update(self._by_line.get(line, ()))
         for i in redo:
-            for line in self._deps[i]:
-                by_line[line].remove(i)
-            piece, deps = self._Piece(doc, outline[i], count, self._in_class[i])
-            self._pieces[i] = self._prefixes[i] + piece
-            self._Index(i, deps)
+            old_span = self._templates[i][1]
+            self._templates[i] = self._Template(doc, outline[i], count, self._in_class[i])
+            if self._templates[i][1] != old_span:
+                self._by_line = None
+            self._pieces[i] = self._prefixes[i] + self._Fill(i, outline[i])
         self.stats['rewritten'] += len(redo)
 
-    def _Index(self, i, deps):
-        self._deps[i] = deps
-        for line in deps:
-            self._by_line.setdefault(line, []).append(i)
+    def _Reusable(self, outline, count):
+        """Per symbol of `outline`, the index of its template at the build,
+        or -1: matched from the start and from the end of both outlines."""
+        old = self._outline
+        top, bottom = self._same_top, self._same_bottom
+        shift = count - self._built_count
+        old_count = self._built_count
+        old_bottom = old_count - bottom  # old lines after this one are unchanged
 
-    def _Build(self, doc, outline):
-        count = doc.GetLineCount()
+        def Map(line):
+            if line <= top:
+                return line
+            if line > old_bottom:
+                return line + shift
+            return None
+
+        def Same(name, kind, header, end, span, new):
+            # The header's lines through the name's all untouched, and the end line.
+            return (new[0] == name and new[1] == kind and Map(header) == new[2] and
+                    (header <= top) == (header + span <= top) and
+                    Map(header + span) == new[2] + span and Map(end) == new[3])
+
+        reuse = [-1] * len(outline)
+        n = min(len(old), len(outline))
+        i = 0
+        while i < n:
+            name, kind, header, end = old[i]
+            new = outline[i]
+            span = self._templates[i][1]
+            if not Same(name, kind, header, end, span, new):
+                break
+            reuse[i] = i
+            i += 1
+        j = 1
+        while j <= n - i:
+            name, kind, header, end = old[-j]
+            new = outline[-j]
+            span = self._templates[-j][1]
+            if not Same(name, kind, header, end, span, new):
+                break
+            reuse[-j] = len(old) - j
+            j += 1
+        return reuse
+
+    def _Build(self, doc, outline, count, reuse):
+        old_templates, old_in_class = self._templates, self._in_class
         self._outline = outline
-        self._pieces = pieces = []
+        self._templates = templates = []
         self._prefixes = prefixes = []
-        self._deps = [()] * len(outline)
-        self._in_class = in_class = []
-        self._by_line = {}
+        self._in_class = in_classes = []
+        self._pieces = pieces = []
+        self._by_line = None
         kinds = {}
         stack = []
+        made = 0
         for i, entry in enumerate(outline):
-            name = entry[0]
+            name, kind, header, end = entry
             parent = name.rpartition('.')[0]
             closed = 0
             while stack and stack[-1] != parent:
                 stack.pop()
                 closed += 1
-            prefix = _kClosers[closed] + ',' if closed else ''
-            if not stack and parent and parent in kinds:
-                # Its parent was closed already (not the list order the
-                # document promises): listed at the top level.
-                parent = ''
-            in_class.append(kinds.get(parent) == kClassKind)
-            piece, deps = self._Piece(doc, entry, count, in_class[-1])
-            kinds[name] = entry[1]
+            prefix = _kPrefixes[closed] if closed < 64 else ']}' * closed + ','
+            in_class = kinds.get(parent) == kClassKind if stack else False
+            kinds[name] = kind
             stack.append(name)
+            k = reuse[i] if reuse is not None else -1
+            if k >= 0 and old_in_class[k] == in_class:
+                template = old_templates[k]
+            else:
+                template = self._Template(doc, entry, count, in_class)
+                made += 1
+            templates.append(template)
             prefixes.append(prefix)
-            pieces.append(prefix + piece)
-            self._Index(i, deps)
+            in_classes.append(in_class)
+            line = header - 1
+            name_line = line + template[1]
+            pieces.append(prefix + template[0] % (line, end - 1, name_line, name_line))
         self._tail = ']}' * len(stack)
-        self.stats['built'] += 1
+        self.stats['built' if reuse is None else 'aligned'] += 1
+        self.stats['rewritten'] += made
 
-    def _Piece(self, doc, entry, count, in_class):
+    def _Fill(self, i, entry):
+        template, span = self._templates[i]
+        line = entry[2] - 1
+        return template % (line, entry[3] - 1, line + span, line + span)
+
+    def _Template(self, doc, entry, count, in_class):
+        """(the symbol's JSON with its line numbers left as %d, where its
+        name's line is after its header's)."""
         name, kind, header_line, end_line = entry
         header = doc.GetLine(header_line)
         bare = BareName(name)
         name_line, name_col = _NamePlace(doc, header_line, end_line, bare, header)
         name_text = header if name_line == header_line else doc.GetLine(name_line)
-        end_text = positions.Content(doc.GetLine(end_line), end_line == count)
-        enc = self._encoding
+        end_text = doc.GetLine(end_line)
+        if end_line != count and end_text.endswith('\r'):
+            end_text = end_text[:-1]
         if kind == kClassKind:
             symbol_kind = kSymbolClass
         else:
             symbol_kind = kSymbolMethod if in_class else kSymbolFunction
         indent = len(header) - len(header.lstrip())
+        enc = self._encoding
         if positions.IsAscii(name_text):
             start, stop = name_col, name_col + len(bare)
         else:
             start = positions.ClientColumn(name_text, name_col, enc)
             stop = positions.ClientColumn(name_text, name_col + len(bare), enc)
-        piece = ('{"name":%s,"detail":%s,"kind":%d,'
-                 '"range":{"start":{"line":%d,"character":%d},"end":{"line":%d,"character":%d}},'
-                 '"selectionRange":{"start":{"line":%d,"character":%d},'
-                 '"end":{"line":%d,"character":%d}},"children":[') % (
-            _JsonString(bare), _JsonString(name), symbol_kind,
-            header_line - 1, positions.ClientColumn(header, indent, enc),
-            end_line - 1, positions.ClientLength(end_text, enc),
-            name_line - 1, start, name_line - 1, stop)
-        deps = tuple(range(header_line, name_line + 1))
-        if end_line > name_line:
-            deps += (end_line,)
-        return piece, deps
+        if not positions.IsAscii(header):
+            indent = positions.ClientColumn(header, indent, enc)
+        end_col = len(end_text) if positions.IsAscii(end_text) else positions.ClientLength(end_text, enc)
+        template = ('{"name":%s,"detail":%s,"kind":%d,'
+                    '"range":{"start":{"line":%%d,"character":%d},"end":{"line":%%d,"character":%d}},'
+                    '"selectionRange":{"start":{"line":%%d,"character":%d},'
+                    '"end":{"line":%%d,"character":%d}},"children":[') % (
+            _JsonString(bare).replace('%', '%%'), _JsonString(name).replace('%', '%%'), symbol_kind,
+            indent, end_col, start, stop)
+        return template, name_line - header_line
 
 
 def FoldingJson(outline):
