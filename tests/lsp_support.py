@@ -137,18 +137,22 @@ def ExpectedSymbols(text, encoding='utf-16'):
         bare = name.rpartition('.')[2].rpartition('#')[0]
         first = header - 1
         rest = '\n'.join(lines[first:first + 9])
-        found = re.search(r'(?:def|class)(?:\s|\\\n)+(%s)\b' % re.escape(bare), rest)
-        before = rest[:found.start(1)]
-        name_line = first + before.count('\n')
-        name_col = len(before) - before.rfind('\n') - 1
+        found = re.search(r'(?:def|class)(?:\s|\\\n)+(%s)(?![A-Za-z0-9_])' % re.escape(bare), rest)
         indent = len(lines[first]) - len(lines[first].lstrip())
+        if found:
+            before = rest[:found.start(1)]
+            name_line = first + before.count('\n')
+            name_col = len(before) - before.rfind('\n') - 1
+            name_len = len(bare)
+        else:  # a name the reader does not take as written: at the header's start
+            name_line, name_col, name_len = first, indent, 0
         symbol = {
             'name': bare, 'detail': name,
             'kind': 5 if kind == 1 else (6 if kinds.get(parent) == 1 else 12),
             'range': {'start': _Position(lines, first, indent, encoding),
                       'end': _Position(lines, end - 1, len(lines[end - 1]), encoding)},
             'selectionRange': {'start': _Position(lines, name_line, name_col, encoding),
-                               'end': _Position(lines, name_line, name_col + len(bare), encoding)},
+                               'end': _Position(lines, name_line, name_col + name_len, encoding)},
             'children': []}
         kinds[name] = kind
         nodes[name] = symbol

@@ -232,6 +232,45 @@ class OutlineTest(unittest.TestCase):
                                                       'position': {'line': 2, 'character': 3}})
         self.assertEqual(hover['contents']['value'], 'scope: A#0.f#0')
 
+    def testPiecesKeptAcrossEditsAreThoseOfAFreshRead(self):
+        # Each case: the edits, then how many symbols may be worked out again
+        # from their lines (the others keep theirs); the answers must be a
+        # fresh read's either way.
+        text = ('class A:\n    def f(self):\n        return 1\n\n    def \\\n        g(self):\n'
+                '        pass\n\n\nclass B(A):\n    x = 1\n\n    def h(self):\n        y = 2\n')
+        cases = [
+            ([Change(2, 15, 2, 15, '0')], 1),                      # typing in a body ending f
+            ([Change(13, 9, 13, 9, 'z')], 2),                      # the last line: ends h and B
+            ([Change(1, 8, 1, 8, ' ')], 1),                        # the header's name moves
+            ([Change(5, 8, 5, 8, 'x')], 1),                        # a name on the header's next line
+            ([Change(2, 16, 2, 16, '\n        x = 2')], 1),         # Enter: A and f end later
+            ([Change(0, 0, 0, 0, 'import os\n')], 1),              # all move down (A's header edited)
+            ([Change(8, 0, 8, 0, '\n\n')], 0),                      # all below move down
+            ([Change(9, 0, 9, 0, 'def k():\n    pass\n')], 2),     # k added, on B's first line
+            ([Change(12, 0, 14, 0, '')], 1),                       # h removed: B ends earlier
+            ([Change(0, 6, 0, 7, 'C'), Change(9, 6, 9, 7, 'D')], 2),  # both classes renamed
+        ]
+        for changes, most in cases:
+            client = CClient()
+            client.Open(text)
+            self.Check(client)
+            stats = client.server.documents['file:///t.py']._symbols.stats
+            before = dict(stats)
+            client.Change(changes)
+            self.Check(client)
+            self.assertEqual(stats['built'], before['built'], changes)
+            self.assertLessEqual(stats['rewritten'] - before['rewritten'], most, changes)
+
+    def testDeepNestingAndNamesOutsideAscii(self):
+        text = ''.join('    ' * n + 'def f%d():\n' % n for n in range(70)) + '    ' * 70 + 'pass\n'
+        # Names as the reader takes them: cut at a letter outside ASCII, or none.
+        text += u'class \u00c9t\u00e9:\n    def g_\u00e9(self):\n        return "\U0001f600"\n'
+        client = CClient()
+        client.Open(text)
+        self.Check(client)
+        client.Change([Change(70, 0, 70, 0, '    ' * 69 + 'def new():\n')])
+        self.Check(client)
+
     def testSeveralChangesInOneNotificationApplyInOrder(self):
         client = CClient()
         client.Open('def f():\n    pass\n')

@@ -32,7 +32,9 @@ kMaxDirtyLines = 256
 # continued by a backslash before its name).
 kNameSearchLines = 8
 
-_kFlags = 0 if _kPy2 else re.UNICODE
+# Names as the reader takes them: ASCII letters, digits and '_' (a name
+# with other letters is cut where they start, or is not a name at all).
+_kFlags = 0 if _kPy2 else re.ASCII
 _kNameOnLine = re.compile(r'\b(?:def|class)[ \t\f]+(\w+)', _kFlags)
 _kNameAcrossLines = re.compile(r'\b(?:def|class)(?:[ \t\f]|\\\r?\n)+(\w+)', _kFlags)
 # What comes before a symbol that closes n symbols before it (shared strings).
@@ -52,11 +54,12 @@ def _JsonString(text):
 
 
 def _NamePlace(doc, header_line, end_line, name, header):
-    """(line, column) of `name` after `def`/`class` in the header, in the
-    document's numbering; the header's first character when not found."""
+    """(line, column, length) of `name` after `def`/`class` in the header,
+    in the document's numbering; the header's first character and length 0
+    when it is not there as written."""
     for match in _kNameOnLine.finditer(header):
         if match.group(1) == name:
-            return header_line, match.start(1)
+            return header_line, match.start(1), len(name)
     last = min(end_line, header_line + kNameSearchLines)
     if last > header_line:
         lines = [header] + [doc.GetLine(n) for n in range(header_line + 1, last + 1)]
@@ -65,8 +68,8 @@ def _NamePlace(doc, header_line, end_line, name, header):
             if match.group(1) == name:
                 before = text[:match.start(1)]
                 line = header_line + before.count('\n')
-                return line, match.start(1) - (before.rfind('\n') + 1)
-    return header_line, len(header) - len(header.lstrip())
+                return line, match.start(1) - (before.rfind('\n') + 1), len(name)
+    return header_line, len(header) - len(header.lstrip()), 0
 
 
 class COutlineJson(object):
@@ -242,7 +245,7 @@ class COutlineJson(object):
         name, kind, header_line, end_line = entry
         header = doc.GetLine(header_line)
         bare = BareName(name)
-        name_line, name_col = _NamePlace(doc, header_line, end_line, bare, header)
+        name_line, name_col, name_len = _NamePlace(doc, header_line, end_line, bare, header)
         name_text = header if name_line == header_line else doc.GetLine(name_line)
         end_text = doc.GetLine(end_line)
         if end_line != count and end_text.endswith('\r'):
@@ -254,10 +257,10 @@ class COutlineJson(object):
         indent = len(header) - len(header.lstrip())
         enc = self._encoding
         if positions.IsAscii(name_text):
-            start, stop = name_col, name_col + len(bare)
+            start, stop = name_col, name_col + name_len
         else:
             start = positions.ClientColumn(name_text, name_col, enc)
-            stop = positions.ClientColumn(name_text, name_col + len(bare), enc)
+            stop = positions.ClientColumn(name_text, name_col + name_len, enc)
         if not positions.IsAscii(header):
             indent = positions.ClientColumn(header, indent, enc)
         end_col = len(end_text) if positions.IsAscii(end_text) else positions.ClientLength(end_text, enc)
