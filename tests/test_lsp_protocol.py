@@ -248,7 +248,7 @@ class OutlineTest(unittest.TestCase):
             ([Change(8, 0, 8, 0, '\n\n')], 0),                      # all below move down
             ([Change(9, 0, 9, 0, 'def k():\n    pass\n')], 2),     # k added, on B's first line
             ([Change(12, 0, 14, 0, '')], 1),                       # h removed: B ends earlier
-            ([Change(0, 6, 0, 7, 'C'), Change(9, 6, 9, 7, 'D')], 2),  # both classes renamed
+            ([Change(0, 6, 0, 7, 'C'), Change(9, 6, 9, 7, 'D')], 5),  # both classes renamed: all names
         ]
         for changes, most in cases:
             client = CClient()
