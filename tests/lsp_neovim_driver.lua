@@ -34,6 +34,10 @@ local function main()
   if document and document ~= '' then
     env.SCOPESERVER_DOCUMENT = document
   end
+  local preload = os.getenv('SCOPE_NVIM_PRELOAD')
+  if preload and preload ~= '' then
+    env.LD_PRELOAD = preload
+  end
   vim.cmd('edit ' .. vim.fn.fnameescape(os.getenv('SCOPE_NVIM_FILE')))
   local buf = api.nvim_get_current_buf()
   local exited = nil

@@ -27,9 +27,7 @@ except (ImportError, SyntaxError):
 
 # Why the server's suites cannot run here, or None.
 kSkipReason = None
-if not PY3:
-    kSkipReason = 'the scope server runs on Python 3 only'
-elif CScopeServer is None:
+if CScopeServer is None:
     kSkipReason = 'pysource.scopeserver is not in the build for this interpreter'
 
 
@@ -43,6 +41,24 @@ def ServerEnvironment():
         paths.append(kToolsDir)
     env['PYTHONPATH'] = os.pathsep.join(paths)
     return env
+
+
+def Which(program):
+    for folder in os.environ.get('PATH', '').split(os.pathsep):
+        path = os.path.join(folder, program)
+        if os.path.isfile(path) and os.access(path, os.X_OK):
+            return path
+    return None
+
+
+def Unicode(text):
+    """`text` as code points (2.7's document text is its UTF-8 bytes)."""
+    return text if PY3 or not isinstance(text, str) else text.decode('utf-8')
+
+
+def DocText(text):
+    """`text` (code points) as the document holds it."""
+    return text.encode('utf-8') if not PY3 and not isinstance(text, str) else text
 
 
 class CClient(object):
@@ -60,7 +76,8 @@ class CClient(object):
 
     def Send(self, msg):
         before = len(self.sent)
-        self.server.HandleMessage(msg)
+        # Through JSON, as a message comes (2.7 then reads its strings as unicode).
+        self.server.HandleMessage(json.loads(json.dumps(msg)))
         return [json.loads(text) for text in self.sent[before:]]
 
     def Request(self, method, params=None, raw=False):
@@ -130,9 +147,11 @@ def _Position(lines, line, column, encoding):
 def ExpectedSymbols(text, encoding='utf-16'):
     """The document symbols a fresh document of `text` gives, worked out here
     from its outline and the text."""
+    text = Unicode(text)
     lines = Lines(text)
     roots, nodes, kinds = [], {}, {}
     for name, kind, header, end in Document(text).GetOutline():
+        name = Unicode(name)
         parent = name.rpartition('.')[0]
         bare = name.rpartition('.')[2].rpartition('#')[0]
         first = header - 1

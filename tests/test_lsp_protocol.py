@@ -11,7 +11,7 @@ import time
 import unittest
 
 import lsp_support
-from lsp_support import CClient, Change, ExpectedFolding, ExpectedSymbols, kSkipReason
+from lsp_support import PY3, CClient, Change, DocText, ExpectedFolding, ExpectedSymbols, kSkipReason
 
 if kSkipReason is None:
     from pysource.scopeserver import framing, protocol
@@ -292,7 +292,7 @@ class PositionsTest(unittest.TestCase):
             self.assertEqual(client.Symbols(), ExpectedSymbols(self.kText, encoding))
             after = {'utf-16': 11, 'utf-8': 13, 'utf-32': 10}[encoding]  # after the emoji
             client.Change([Change(1, after, 1, after, 'x')])
-            self.assertEqual(client.Text().split('\n')[1], u'    s = "\U0001f600x\u00e9"')
+            self.assertEqual(client.Text().split('\n')[1], DocText(u'    s = "\U0001f600x\u00e9"'))
             self.assertEqual(client.Symbols(), ExpectedSymbols(client.Text(), encoding))
             self.assertEqual(client.Symbols()[0]['selectionRange']['start']['character'],
                              {'utf-16': 7, 'utf-8': 9, 'utf-32': 7}[encoding])
@@ -302,7 +302,7 @@ class PositionsTest(unittest.TestCase):
         client.Open(u'x = "\U0001f600"\n')
         client.Change([Change(0, 6, 0, 6, 'a')])  # inside the pair: before it
         client.Change([Change(0, 99, 0, 99, '#')])  # past the end: at the end
-        self.assertEqual(client.Text(), u'x = "a\U0001f600"#\n')
+        self.assertEqual(client.Text(), DocText(u'x = "a\U0001f600"#\n'))
 
     def testCrLfLines(self):
         text = 'class A:\r\n    def f(self):\r\n        pass\r\n'
@@ -415,7 +415,7 @@ class PipesTest(unittest.TestCase):
                     'uri': 'file:///p.py', 'languageId': 'python', 'version': 1, 'text': kSample}}) +
                 self.Message('textDocument/documentSymbol', {'textDocument': {'uri': 'file:///p.py'}}, 2) +
                 self.Message('shutdown', None, 3) + self.Message('exit', None))
-        out, err = server.communicate(data, timeout=60)
+        out, err = server.communicate(data, **({'timeout': 60} if PY3 else {}))
         self.assertEqual(server.returncode, 0, err)
         reader = CMessageReader(Feed([out]))
         answers = {}

@@ -36,6 +36,9 @@ kUninitialized, kRunning, kShutDown = 'uninitialized', 'running', 'shut down'
 
 
 def FilenameOf(uri):
+    """The path of a file: URI (the URI itself otherwise), as a str."""
+    if _kPy2 and not isinstance(uri, str):
+        uri = uri.encode('utf-8')
     parsed = urlparse(uri)
     if parsed.scheme == 'file':
         return unquote(parsed.path) or uri
