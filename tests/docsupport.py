@@ -2,6 +2,11 @@
 
 import random
 
+try:
+    from pysource.logicals import ReadReference
+except ImportError:  # a reader without the native scanner
+    from pysource.logicals import ReadLogicals as ReadReference
+
 from support import PY3, CChangeFinder, ReadLogicals, kBlankKind, kCommentKind  # noqa: F401
 from pysource.scopebodycache import GetFullNameForScopeDef
 from pysource.scopedocument import CScopeDocument, CEditResult  # noqa: F401
@@ -36,9 +41,10 @@ def Fields(logical):
 
 
 def Fresh(text, filename='<string>'):
-    """The logicals of `text` named by a whole-file pass, or the reader's error."""
+    """The logicals of `text` named by a whole-file pass, or the reader's error,
+    by the reference reader (the rules written out in Python)."""
     try:
-        lst = ReadLogicals(text, filename)
+        lst = ReadReference(text, filename)
     except SyntaxError as exc:
         return exc
     CChangeFinder(lst).FindChanges(lst, [])
@@ -85,7 +91,13 @@ def Apply(text, start, end, new):
 # lines that open and close scopes.
 kPieces = ['x', ' ', '\n', '    ', '\t', '"', "'", '"""', "'''", 'r"', '(', ')', '[', ']', '\\', '\\\n',
            '#', '\r\n', '\r', 'def f():\n', 'class C:\n', '    pass\n', 'if x:\n', 'async def h():\n',
-           '\f', 'return 1\n', 'u"', ':', '    def m(self):\n        y = 2\n']
+           '\f', 'return 1\n', 'u"', ':', '    def m(self):\n        y = 2\n', '  ', '\n  x\n', 'b\'\'\'',
+           "ur'", '}', '\t\t', '\\\r\n', '"a\\\n', '\n\n']
+if PY3:
+    # Characters that widen the text's storage.
+    kPieces += [u'\xe9', u'\u4e2d', u'\U0001F600']
+else:
+    kPieces += ['\xc3\xa9', '\xef\xbb\xbf']
 
 
 def RandomEdit(rng, text):

@@ -3,11 +3,12 @@ not read and back, the body cache, pickling and copying."""
 
 import copy
 import gc
+import os
 import pickle
 import sys
 import unittest
 
-from support import PY3, Picklers
+from support import PY3, Picklers, RunPython
 from docsupport import (CEditResult, CScopeDocument, ErrorFields, Fields, Fresh, Outline, Place,
                         kSample)
 
@@ -254,6 +255,86 @@ class PicklingTest(DocumentTestCase):
         self.assertRaises(TypeError, doc.__setstate__, 5)
         self.assertRaises(ValueError, doc.__setstate__, '(')
         self.assertMatchesFresh(doc, 'x = 1\n')
+
+
+class ReadAgainOnlyWhatChangedTest(DocumentTestCase):
+    """The rows an edit reads again are bounded by what its state needs,
+    whatever the size of the text."""
+
+    def setUp(self):
+        self.text = kSample * 40      # 800 lines
+        self.doc = CScopeDocument(self.text)
+
+    def Stats(self, *edit):
+        self.doc.Edit(*edit)
+        return self.doc.GetLastEditStats()
+
+    def testTypingAndLinesReadOneLogical(self):
+        self.assertEqual(self.Stats(407, 16, 407, 16, 'y')['rows_scanned'], 1)
+        stats = self.Stats(407, 8, 407, 8, 'z = 1\n        ')
+        self.assertEqual((stats['rows_scanned'], stats['logicals_made']), (2, 2))
+        # A line put in reads itself and the line it pushed down.
+        self.assertEqual(self.Stats(405, 0, 405, 0, 'def new(self):\n')['rows_scanned'], 2)
+        # Inside a string spanning rows, its logical is read whole.
+        self.assertEqual(self.Stats(439, 5, 439, 5, 'more ')['rows_scanned'], 3)
+        self.assertMatchesFresh(self.doc)
+
+    def testOpeningAQuoteReadsToTheEndClosingItReadsALine(self):
+        stats = self.Stats(2, 0, 2, 0, "'''")
+        self.assertGreater(stats['rows_scanned'], 790)
+        self.assertFalse(stats['find_changes_called'])
+        r = self.doc.Edit(2, 0, 2, 3, '')
+        self.assertEqual(self.doc.GetLastEditStats()['rows_scanned'], 1)
+        self.assertEqual(r.fRegion, (2, 1, 1))
+        self.assertEqual((r.fAdded, r.fRemoved), ([], []))
+        self.assertMatchesFresh(self.doc, self.text)
+
+    def testABackslashJoinsAndSplitsLogicals(self):
+        # The blank line under a continued one is no logical of its own.
+        r = self.doc.Edit(1, 9, 1, 9, ' \\')
+        self.assertEqual(([l.fTokens for l in r.fAdded], [l.fKind for l in r.fRemoved]), ([], [22]))
+        self.assertMatchesFresh(self.doc)
+        r = self.doc.Edit(12, 16, 12, 16, ' \\')
+        self.assertEqual((len(r.fRemoved), [l.fTokens for l in r.fAdded]), (2, [('pass', 'return', 'inner')]))
+        self.assertMatchesFresh(self.doc)
+
+
+class HandEditedLogicalsTest(unittest.TestCase):
+
+    def testALineNumberChangedFromOutsideIsRefusedAndDetected(self):
+        doc = CScopeDocument(kSample)
+        doc.GetLogicals()[5].fLineno = 100
+        with self.assertRaises(RuntimeError):
+            doc.Edit(6, 0, 6, 0, '#')
+        self.assertEqual(doc.GetText(), kSample)
+        self.assertRaises(AssertionError, doc.SelfCheck)
+
+    def testANameChangedFromOutsideIsDetected(self):
+        doc = CScopeDocument(kSample)
+        doc.GetLogicals()[6].fScopeName = 'elsewhere'
+        with self.assertRaises(AssertionError) as caught:
+            doc.SelfCheck()
+        self.assertIn('elsewhere', str(caught.exception))
+
+
+class CheckEveryEditTest(unittest.TestCase):
+
+    def testTheEnvironmentSwitchChecksEachEdit(self):
+        code = """
+            from pysource.scopedocument import CScopeDocument
+            doc = CScopeDocument('def f():\\n    pass\\n')
+            doc.Edit(2, 4, 2, 8, 'return')
+            doc.GetLogicals()[1].fKind = 1
+            try:
+                doc.Edit(1, 0, 1, 0, '#')
+            except AssertionError as exc:
+                print('checked: %s' % str(exc).splitlines()[0])
+        """
+        status, out, err = RunPython(code, dict(os.environ, SBC_CHECK_DOCUMENT='1'))
+        self.assertEqual(status, 0, err)
+        self.assertIn('checked: the document differs', out)
+        status, out, err = RunPython(code, dict(os.environ, SBC_CHECK_DOCUMENT='0'))
+        self.assertEqual((status, out), (0, ''), err)
 
 
 class LeakTest(unittest.TestCase):

@@ -55,9 +55,12 @@ py::Ref call(const char* function, PyObject* a, PyObject* b, PyObject* c) {
 void selfCheck(Document& d) {
     std::string problems;
     checkRows(d, problems);
-    PyObject* text = wholeText(d);
+    py::Ref held = py::Ref::own(wholeText(d));
+    PyObject* text = held.get();
     py::Ref logicals = logicalsCopy(d);
     if (d.readable) {
+        const std::string rows = checkRowStates(d);
+        if (!rows.empty()) addProblem(problems, rows);
         collect(call("CompareLogicals", text, d.filename.get(), logicals.get()).get(), problems);
         if (problems.empty()) collect(call("CompareCache", d.cache.get(), logicals.get(), nullptr).get(), problems);
     } else {
