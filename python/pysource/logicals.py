@@ -395,20 +395,36 @@ def _Records(source, filename='<string>'):
             yield (), source.count('\n') + 1, _IndentWidth(last, len(last)), kBlankKind
 
 
-def ReadLogicals(source, filename='<string>'):
+def ReadLogicals(source, filename='<string>', reference=False):
     """The list of logicals of `source`.
 
     On 2.7 `source` is a str, or unicode taken as UTF-8. On 3.x it is a str,
     or bytes decoded as the source declares. Raises SyntaxError, with the
     line number, for source that does not tokenize or decode
     (IndentationError for an inconsistent dedent).
+
+    The native reader (pysource._reader) reads by default; `reference`
+    reads with the rules written out in this module instead. Both give the
+    same logicals and the same errors.
     """
     # Imported here so that the records can be read where the record type
     # is not built.
     from pysource._fastaccess import LogicalLineType
+    if not reference:
+        text = _SourceText(source, filename)
+        if type(text) is str:
+            from pysource import _reader
+            return _reader.Read(text, filename, LogicalLineType)
+        # A str subclass or another buffer: read as the reference reads it.
+    return ReadReference(source, filename)
+
+
+def ReadReference(source, filename='<string>'):
+    """ReadLogicals(source, filename, reference=True)."""
+    from pysource._fastaccess import LogicalLineType
     return [LogicalLineType(*record) for record in _Records(source, filename)]
 
 
-def ReadLogicalsFromFile(path):
+def ReadLogicalsFromFile(path, reference=False):
     """The list of logicals of the file at `path` (newlines normalised)."""
-    return ReadLogicals(_SourceOfFile(path), path)
+    return ReadLogicals(_SourceOfFile(path), path, reference)

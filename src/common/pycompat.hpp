@@ -12,6 +12,7 @@
 #include <frameobject.h>
 
 #include <cstdarg>
+#include <cstdint>
 #include <cstring>
 #include <string_view>
 
@@ -208,6 +209,59 @@ PyObject* strConcat(const std::string_view (&parts)[N]) noexcept {
     }
     return result;
 }
+
+// --- Text as characters (the reader) -----------------------------------------
+
+// The characters of an exact str to read: 2.7's bytes (kind 1); on 3.x the
+// str's own array, of 1, 2 or 4 bytes a character, and whether it is ASCII.
+struct TextChars {
+    const void* data;
+    Py_ssize_t length;
+    int kind;
+    bool ascii;
+};
+
+inline bool textChars(PyObject* s, TextChars* out) noexcept {
+#if PY_MAJOR_VERSION >= 3
+#if PY_VERSION_HEX < 0x030C0000
+    if (PyUnicode_READY(s) == -1) return false;
+#endif
+    out->data = PyUnicode_DATA(s);
+    out->length = PyUnicode_GET_LENGTH(s);
+    out->kind = static_cast<int>(PyUnicode_KIND(s));
+    out->ascii = PyUnicode_IS_ASCII(s) != 0;
+#else
+    out->data = PyString_AS_STRING(s);
+    out->length = PyString_GET_SIZE(s);
+    out->kind = 1;
+    out->ascii = false;
+#endif
+    return true;
+}
+
+// A new str of `n` characters of such an array (`ascii`: known to be ASCII).
+inline PyObject* strFromChars(const uint8_t* p, Py_ssize_t n, bool ascii) noexcept {
+#if PY_MAJOR_VERSION >= 3
+    if (ascii) {
+        PyObject* s = PyUnicode_New(n, 127);
+        if (s != nullptr && n > 0) std::memcpy(PyUnicode_DATA(s), p, static_cast<size_t>(n));
+        return s;
+    }
+    return PyUnicode_FromKindAndData(PyUnicode_1BYTE_KIND, p, n);
+#else
+    (void)ascii;
+    return PyString_FromStringAndSize(reinterpret_cast<const char*>(p), n);
+#endif
+}
+
+#if PY_MAJOR_VERSION >= 3
+inline PyObject* strFromChars(const uint16_t* p, Py_ssize_t n, bool) noexcept {
+    return PyUnicode_FromKindAndData(PyUnicode_2BYTE_KIND, p, n);
+}
+inline PyObject* strFromChars(const uint32_t* p, Py_ssize_t n, bool) noexcept {
+    return PyUnicode_FromKindAndData(PyUnicode_4BYTE_KIND, p, n);
+}
+#endif
 
 // Whether two exact strs are equal.
 inline bool strEqual(PyObject* a, PyObject* b) noexcept {
@@ -696,7 +750,7 @@ inline CharsView strChars(PyObject* s) {
 
 // A new str of `n` characters of `width` bytes each (code points on 3.x,
 // bytes on 2.7); null with an exception set.
-inline PyObject* strFromChars(const void* data, int width, Py_ssize_t n) noexcept {
+inline PyObject* strFromWidth(const void* data, int width, Py_ssize_t n) noexcept {
 #if PY_MAJOR_VERSION >= 3
     return PyUnicode_FromKindAndData(width, data, n);
 #else

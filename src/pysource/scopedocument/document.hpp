@@ -16,6 +16,7 @@
 #include "common/pyref.hpp"
 #include "pysource/scopedocument/text_store.hpp"
 
+#include <climits>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -30,6 +31,10 @@ struct Damage {
     size_t end = 0;
     std::vector<uint32_t> baselineMiddle;
     long lineDelta = 0;       // current rows minus baseline rows
+    // The least indentation column among the baseline's rows that edits
+    // took out of the row table (INT64_MAX: none), and how many rows they took.
+    int64_t droppedMinColumn = INT64_MAX;
+    size_t rowsDropped = 0;
     size_t baselineRows = 0;  // rows of the baseline text
     bool baselineEndsWithNewline = false;
 };
@@ -42,6 +47,14 @@ struct EditStats {
     size_t edits = 0;
     bool findChangesCalled = false;
     bool wholeRead = false;
+};
+
+// The indentation stack in force at the start of a row, kept from the last
+// edit: the next one near it starts from there instead of walking up.
+struct StackCache {
+    bool valid = false;
+    size_t row = 0;
+    std::vector<int64_t> stack;
 };
 
 struct Document {
@@ -58,6 +71,7 @@ struct Document {
     uint64_t version = 0;
     Damage damage;
     EditStats stats;
+    StackCache stackCache;
 };
 
 struct DocumentObject {
@@ -70,12 +84,11 @@ inline Document& documentOf(PyObject* self) noexcept {
     return *reinterpret_cast<DocumentObject*>(self)->doc;
 }
 
-// One text edit as the caller gave it, validated: characters [start, end)
-// of the text as it stands before this edit are replaced by `text`.
-struct TextEdit {
-    size_t start = 0;
-    size_t end = 0;
-    py::Ref text;
+// What one edit call did, for its CEditResult.
+struct EditOutcome {
+    py::Ref added, removed;
+    py::Ref changes;  // FindChanges' (contents, class, function), or null
+    size_t regionFirstLine = 1, regionOldLines = 0, regionNewLines = 0;
 };
 
 // --- document_type.cpp -----------------------------------------------------------
@@ -114,6 +127,19 @@ PyObject* wholeText(Document& d);
 // Whether SBC_CHECK_DOCUMENT asks for a self-check after every edit.
 extern bool gCheckEveryEdit;
 
+// --- reread.cpp ------------------------------------------------------------------------
+// Reads a fresh text whole: rows' states, the logicals (or the error).
+// Returns the list of logicals, or null with the document's error set.
+py::Ref readWhole(Document& d);
+// Reads the damaged part again and, when the text reads, brings the list,
+// the names and the cache to it.
+void reread(Document& d, EditOutcome& out);
+// How the rows' states and columns differ from a whole scan of the text
+// (empty when they agree). Only for a text that reads.
+std::string checkRowStates(Document& d);
+// The length of a leading BOM of the text (0 without one).
+size_t bomLength(const Document& d);
+
 // --- queries.cpp -----------------------------------------------------------------------
 py::Ref getLine(Document& d, PyObject* lineno);
 py::Ref scopeAtLine(Document& d, PyObject* lineno);
@@ -128,11 +154,6 @@ void restoreDocument(PyObject* self, PyObject* state);
 void selfCheck(Document& d);
 
 // --- edit_result.cpp ---------------------------------------------------------------------
-struct EditOutcome {
-    py::Ref added, removed;
-    py::Ref changes;  // FindChanges' (contents, class, function), or null
-    size_t regionFirstLine = 1, regionOldLines = 0, regionNewLines = 0;
-};
 PyTypeObject* editResultType() noexcept;
 void readyEditResultType();
 py::Ref makeEditResult(Document& d, EditOutcome& outcome);

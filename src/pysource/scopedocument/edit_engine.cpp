@@ -29,18 +29,6 @@ bool gCheckEveryEdit = false;
 
 namespace {
 
-LogicalLineObject* record(PyObject* o) noexcept { return reinterpret_cast<LogicalLineObject*>(o); }
-
-bool sameSignature(PyObject* a, PyObject* b) noexcept {
-    const LogicalLineObject* x = record(a);
-    const LogicalLineObject* y = record(b);
-    if (x->fKind != y->fKind || x->fIndent != y->fIndent || x->fTokenCount != y->fTokenCount) return false;
-    for (Py_ssize_t i = 0; i < x->fTokenCount; ++i) {
-        if (!compat::strEqual(x->fTokens[i], y->fTokens[i])) return false;
-    }
-    return true;
-}
-
 // The number of '\n' among characters [start, end).
 size_t newlinesIn(const TextStore& t, size_t start, size_t end) {
     size_t n = 0;
@@ -48,24 +36,35 @@ size_t newlinesIn(const TextStore& t, size_t start, size_t end) {
     return n;
 }
 
+// What an edit took out of the row table, to put back when it is undone.
+struct DroppedRows {
+    std::vector<RowState> states;
+    std::vector<int16_t> columns;
+};
+
+uint32_t charOf(const void* data, int width, size_t i) noexcept {
+    switch (width) {
+    case 1: return static_cast<const uint8_t*>(data)[i];
+    case 2: return static_cast<const uint16_t*>(data)[i];
+    default: return static_cast<const uint32_t*>(data)[i];
+    }
+}
+
 // Characters [start, end) of the text replaced by the `n` characters at
-// `data`, with the rows following.
-void replaceText(Document& d, size_t start, size_t end, const void* data, int width, size_t n) {
+// `data`, with the rows following; `restore` gives the states and columns
+// of the rows it puts in (an undo).
+void replaceText(Document& d, size_t start, size_t end, const void* data, int width, size_t n,
+                 const DroppedRows* restore) {
     const size_t r0 = rowOfOffset(d, start) - 1;
     const size_t removed = newlinesIn(d.text, start, end);
     std::vector<size_t> starts;
     for (size_t i = 0; i < n; ++i) {
-        uint32_t c;
-        switch (width) {
-        case 1: c = static_cast<const uint8_t*>(data)[i]; break;
-        case 2: c = static_cast<const uint16_t*>(data)[i]; break;
-        default: c = static_cast<const uint32_t*>(data)[i]; break;
-        }
-        if (c == '\n') starts.push_back(start + i + 1);
+        if (charOf(data, width, i) == '\n') starts.push_back(start + i + 1);
     }
     const size_t oldSize = d.text.size();
     const size_t newSize = oldSize - (end - start) + n;
-    d.rows.replace(r0, removed, starts, newSize, oldSize);
+    d.rows.replace(r0, removed, starts, newSize, oldSize, restore ? restore->states.data() : nullptr,
+                   restore ? restore->columns.data() : nullptr);
     d.text.replace(start, end, data, width, n);
     d.textCache.reset();
 }
@@ -74,7 +73,8 @@ bool endsWithNewline(const TextStore& t) { return t.size() > 0 && t.at(t.size() 
 
 // Widens the damage to cover characters [start, end) of the text as it
 // stands before an edit that puts `n` characters there.
-void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlinesRemoved, size_t newlinesAdded) {
+void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlinesRemoved, size_t newlinesAdded,
+                  const DroppedRows& dropped) {
     Damage& g = d.damage;
     if (!g.active) {
         g.active = true;
@@ -98,6 +98,10 @@ void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlin
         }
     }
     g.end = g.end + n - (end - start);
+    g.rowsDropped += dropped.columns.size();
+    for (int16_t c : dropped.columns) {
+        if (c >= 0) g.droppedMinColumn = std::min<int64_t>(g.droppedMinColumn, c);
+    }
     g.lineDelta += static_cast<long>(newlinesAdded) - static_cast<long>(newlinesRemoved);
 }
 
@@ -105,12 +109,21 @@ struct Undo {
     size_t start;
     size_t length;  // of the text put in
     std::vector<uint32_t> removed;
+    DroppedRows rows;
 };
 
-// Applies the batch to the text; on a bad edit restores text, rows and
-// damage and rethrows.
-void applyToText(Document& d, std::vector<TextEdit>& edits, const std::vector<EditSpec>& specs, bool utf16) {
-    std::vector<Undo> undo;
+void undoAll(Document& d, std::vector<Undo>& undo, const Damage& saved) {
+    for (size_t k = undo.size(); k-- > 0;) {
+        const Undo& u = undo[k];
+        replaceText(d, u.start, u.start + u.length, u.removed.data(), 4, u.removed.size(), &u.rows);
+    }
+    undo.clear();
+    d.damage = saved;
+}
+
+// Applies the batch to the text, keeping in `undo` what puts it back; on a
+// bad edit restores text, rows and damage and rethrows.
+void applyToText(Document& d, const std::vector<EditSpec>& specs, bool utf16, std::vector<Undo>& undo) {
     const Damage saved = d.damage;
     try {
         for (const EditSpec& spec : specs) {
@@ -120,124 +133,23 @@ void applyToText(Document& d, std::vector<TextEdit>& edits, const std::vector<Ed
             const compat::CharsView chars = compat::strChars(spec.text);
             const size_t n = static_cast<size_t>(chars.length);
             size_t added = 0;
-            for (size_t i = 0; i < n; ++i) {
-                uint32_t c = chars.width == 1   ? static_cast<const uint8_t*>(chars.data)[i]
-                             : chars.width == 2 ? static_cast<const uint16_t*>(chars.data)[i]
-                                                : static_cast<const uint32_t*>(chars.data)[i];
-                added += c == '\n';
-            }
-            Undo u{start, n, {}};
+            for (size_t i = 0; i < n; ++i) added += charOf(chars.data, chars.width, i) == '\n';
+            Undo u{start, n, {}, {}};
             d.text.copyOut(start, end, u.removed);
-            extendDamage(d, start, end, n, newlinesIn(d.text, start, end), added);
-            replaceText(d, start, end, chars.data, chars.width, n);
+            const size_t removedNewlines = newlinesIn(d.text, start, end);
+            const size_t r0 = rowOfOffset(d, start) - 1;
+            for (size_t r = r0 + 1; r <= r0 + removedNewlines; ++r) {
+                u.rows.states.push_back(d.rows.state(r));
+                u.rows.columns.push_back(d.rows.column(r));
+            }
+            extendDamage(d, start, end, n, removedNewlines, added, u.rows);
+            replaceText(d, start, end, chars.data, chars.width, n, nullptr);
             undo.push_back(std::move(u));
-            TextEdit e;
-            e.start = start;
-            e.end = end;
-            e.text = py::Ref::own(spec.text);
-            edits.push_back(std::move(e));
         }
     } catch (...) {
-        for (size_t k = undo.size(); k-- > 0;) {
-            const Undo& u = undo[k];
-            replaceText(d, u.start, u.start + u.length, u.removed.data(), 4, u.removed.size());
-        }
-        d.damage = saved;
+        undoAll(d, undo, saved);
         throw;
     }
-}
-
-py::Ref callReader(Document& d) {
-    PyObject* text = wholeText(d);
-    return py::Ref::steal(PyObject_CallFunctionObjArgs(gImports.readLogicals, text, d.filename.get(), nullptr));
-}
-
-// The pending SyntaxError as the document's error; false (the exception
-// still set) for any other failure.
-bool takeSyntaxError(Document& d) {
-    if (!PyErr_ExceptionMatches(PyExc_SyntaxError)) return false;
-    PyObject *type, *value, *tb;
-    PyErr_Fetch(&type, &value, &tb);
-    PyErr_NormalizeException(&type, &value, &tb);
-    py::Ref keepType = py::Ref::steal(type);
-    py::Ref keepTb = py::Ref::steal(tb);
-    d.error = py::Ref::steal(value);
-    d.readable = false;
-    return true;
-}
-
-
-// Brings the list to `fresh` (the logicals of the current text): the common
-// prefix (same tokens, kind, indent, line) and suffix (same tokens, kind,
-// indent; line numbers taken from `fresh`) stay as they are.
-void followFresh(Document& d, PyObject* fresh, EditOutcome& out) {
-    PyObject* list = d.list.get();
-    const Py_ssize_t oldN = PyList_GET_SIZE(list);
-    const Py_ssize_t newN = PyList_GET_SIZE(fresh);
-    const Py_ssize_t limit = std::min(oldN, newN);
-    Py_ssize_t head = 0;
-    while (head < limit) {
-        PyObject* a = PyList_GET_ITEM(list, head);
-        PyObject* b = PyList_GET_ITEM(fresh, head);
-        if (record(a)->fLineno != record(b)->fLineno || !sameSignature(a, b)) break;
-        ++head;
-    }
-    Py_ssize_t tail = 0;
-    while (tail < limit - head &&
-           sameSignature(PyList_GET_ITEM(list, oldN - 1 - tail), PyList_GET_ITEM(fresh, newN - 1 - tail))) {
-        ++tail;
-    }
-    for (Py_ssize_t k = 1; k <= tail; ++k) {
-        record(PyList_GET_ITEM(list, oldN - k))->fLineno = record(PyList_GET_ITEM(fresh, newN - k))->fLineno;
-    }
-    out.removed = py::check(PyList_GetSlice(list, head, oldN - tail));
-    out.added = py::check(PyList_GetSlice(fresh, head, newN - tail));
-    py::checkStatus(PyList_SetSlice(list, head, oldN - tail, out.added.get()));
-    d.stats.logicalsShifted = static_cast<size_t>(tail);
-    d.stats.logicalsRemoved = static_cast<size_t>(oldN - tail - head);
-}
-
-void clearCache(Document& d, PyObject* changes) {
-    for (Py_ssize_t k = 0; k < 3; ++k) {
-        PyObject* set = PyTuple_GET_ITEM(changes, k);
-        if (PySet_GET_SIZE(set) == 0) continue;
-        py::check(PyObject_CallMethod(d.cache.get(), const_cast<char*>("Clear"), const_cast<char*>("(O)"), set));
-    }
-}
-
-void findChanges(Document& d, EditOutcome& out) {
-    py::Ref result = py::check(PyObject_CallMethod(d.finder.get(), const_cast<char*>("FindChanges"),
-                                                   const_cast<char*>("(OO)"), out.added.get(), out.removed.get()));
-    if (!PyTuple_Check(result.get()) || PyTuple_GET_SIZE(result.get()) != 3) {
-        msg::raise(PyExc_SystemError, "FindChanges did not answer three sets");
-    }
-    out.changes = std::move(result);
-    d.stats.findChangesCalled = true;
-    clearCache(d, out.changes.get());
-}
-
-// Reads the current text into the document's state after the text changed.
-void follow(Document& d, EditOutcome& out) {
-    const size_t oldRows = d.damage.baselineRows;
-    py::Ref fresh = callReader(d);
-    d.stats.wholeRead = true;
-    d.stats.rowsScanned = d.rows.count();
-    out.regionFirstLine = 1;
-    out.regionOldLines = oldRows;
-    out.regionNewLines = d.rows.count();
-    if (!fresh) {
-        if (!takeSyntaxError(d)) py::fail();
-        out.added = py::check(PyList_New(0));
-        out.removed = py::check(PyList_New(0));
-        return;
-    }
-    if (!PyList_CheckExact(fresh.get())) msg::raise(PyExc_SystemError, "ReadLogicals did not answer a list");
-    d.stats.logicalsMade = static_cast<size_t>(PyList_GET_SIZE(fresh.get()));
-    followFresh(d, fresh.get(), out);
-    d.readable = true;
-    d.error.reset();
-    d.damage = Damage();
-    findChanges(d, out);
 }
 
 // The source as the document keeps it: the interpreter's str.
@@ -305,15 +217,11 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
     d.damage = Damage();
     d.stats = EditStats();
     d.version = 0;
-    py::Ref fresh = callReader(d);
-    d.stats.wholeRead = true;
-    d.stats.rowsScanned = d.rows.count();
+    py::Ref fresh = readWhole(d);
     if (fresh) {
-        d.stats.logicalsMade = static_cast<size_t>(PyList_GET_SIZE(fresh.get()));
         py::checkStatus(PyList_SetSlice(d.list.get(), 0, 0, fresh.get()));
         d.readable = true;
     } else {
-        if (!takeSyntaxError(d)) py::fail();
         // The baseline is the empty text.
         d.damage.active = true;
         d.damage.start = 0;
@@ -332,18 +240,35 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
 
 py::Ref applyEdits(Document& d, const std::vector<EditSpec>& specs, bool utf16) {
     BusyGuard busy(d);
+    const EditStats before = d.stats;
     d.stats = EditStats();
     d.stats.edits = specs.size();
-    std::vector<TextEdit> edits;
-    applyToText(d, edits, specs, utf16);
-    EditOutcome out;
-    if (edits.empty()) {
-        out.added = py::check(PyList_New(0));
-        out.removed = py::check(PyList_New(0));
-        out.regionFirstLine = 1;
-        return finishEdit(d, out);
+    const Damage saved = d.damage;
+    std::vector<Undo> undo;
+    try {
+        applyToText(d, specs, utf16, undo);
+    } catch (...) {
+        d.stats = before;
+        throw;
     }
-    follow(d, out);
+    EditOutcome out;
+    if (!undo.empty()) {
+        try {
+            // Anything the reader raises but its SyntaxErrors (a record
+            // out of the record type's range, no memory) puts the text back.
+            reread(d, out);
+        } catch (...) {
+            if (d.list && !out.added) {
+                py::SavedError pending;
+                undoAll(d, undo, saved);
+                d.stats = before;
+                pending.restore();
+            }
+            throw;
+        }
+    }
+    if (!out.added) out.added = py::check(PyList_New(0));
+    if (!out.removed) out.removed = py::check(PyList_New(0));
     return finishEdit(d, out);
 }
 
@@ -367,7 +292,7 @@ py::Ref setText(Document& d, PyObject* source) {
     // The one edit, in lines and columns of the current text.
     const size_t startRow = rowOfOffset(d, head) - 1;
     const size_t endRow = rowOfOffset(d, old - tail) - 1;
-    py::Ref middle = py::check(compat::strFromChars(
+    py::Ref middle = py::check(compat::strFromWidth(
         static_cast<const uint8_t*>(chars.data) + head * chars.width, chars.width, n - tail - head));
     py::Ref sl = py::check(compat::intFromSsize(startRow + 1));
     py::Ref sc = py::check(compat::intFromSsize(head - d.rows.start(startRow, old)));

@@ -19,7 +19,7 @@ py::Ref baselineText(Document& d) {
     d.text.copyOut(0, g.start, chars);
     chars.insert(chars.end(), g.baselineMiddle.begin(), g.baselineMiddle.end());
     d.text.copyOut(g.end, d.text.size(), chars);
-    return py::check(compat::strFromChars(chars.data(), 4, static_cast<Py_ssize_t>(chars.size())));
+    return py::check(compat::strFromWidth(chars.data(), 4, static_cast<Py_ssize_t>(chars.size())));
 }
 
 }  // namespace

@@ -72,7 +72,7 @@ size_t offsetOf(Document& d, PyObject* linenoArg, PyObject* columnArg, bool utf1
     const size_t start = d.rows.start(r, d.text.size());
     const size_t length = rowLength(d, r);
     if (column < 0) {
-        PyErr_Format(PyExc_ValueError, "%s column %zd is negative", which, column);
+        PyErr_Format(PyExc_ValueError, "%s column %zd of line %zd is negative", which, column, lineno);
         py::fail();
     }
     if (!utf16) {

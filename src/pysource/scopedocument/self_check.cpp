@@ -58,6 +58,8 @@ void selfCheck(Document& d) {
     PyObject* text = wholeText(d);
     py::Ref logicals = logicalsCopy(d);
     if (d.readable) {
+        const std::string rows = checkRowStates(d);
+        if (!rows.empty()) addProblem(problems, rows);
         collect(call("CompareLogicals", text, d.filename.get(), logicals.get()).get(), problems);
         if (problems.empty()) collect(call("CompareCache", d.cache.get(), logicals.get(), nullptr).get(), problems);
     } else {

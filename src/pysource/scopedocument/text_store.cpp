@@ -39,6 +39,8 @@ void TextStore::assign(const void* data, int width, size_t n) {
     if (width > 1) {
         for (size_t i = 0; i < n && need < width; ++i) need = std::max(need, widthOf(charAt(data, width, i)));
     }
+    carriageReturns_ = 0;
+    for (size_t i = 0; i < n; ++i) carriageReturns_ += charAt(data, width, i) == '\r';
     std::vector<uint8_t> fresh((n + 64) * need);
     buf_.swap(fresh);
     width_ = need;
@@ -99,6 +101,8 @@ void TextStore::replace(size_t start, size_t end, const void* data, int width, s
         for (size_t i = 0; i < n && need < width; ++i) need = std::max(need, widthOf(charAt(data, width, i)));
     }
     if (need > width_) widen(need);
+    for (size_t i = start; i < end; ++i) carriageReturns_ -= at(i) == '\r';
+    for (size_t i = 0; i < n; ++i) carriageReturns_ += charAt(data, width, i) == '\r';
     moveGap(end);
     // The removed characters join the gap.
     gapStart_ = start;
@@ -126,14 +130,14 @@ void TextStore::copyOut(size_t start, size_t end, std::vector<uint32_t>& out) co
 PyObject* TextStore::slice(size_t start, size_t end) {
     const size_t w = static_cast<size_t>(width_);
     const uint8_t* b = buf_.data();
-    if (end <= gapStart_) return py::check(compat::strFromChars(b + start * w, width_, end - start)).release();
+    if (end <= gapStart_) return py::check(compat::strFromWidth(b + start * w, width_, end - start)).release();
     if (start >= gapStart_) {
         const size_t gap = gapEnd_ - gapStart_;
-        return py::check(compat::strFromChars(b + (start + gap) * w, width_, end - start)).release();
+        return py::check(compat::strFromWidth(b + (start + gap) * w, width_, end - start)).release();
     }
     // Across the gap: moved so that the slice is contiguous.
     moveGap(end);
-    return py::check(compat::strFromChars(b + start * w, width_, end - start)).release();
+    return py::check(compat::strFromWidth(b + start * w, width_, end - start)).release();
 }
 
 size_t TextStore::findNewline(size_t from) const noexcept {
@@ -217,7 +221,7 @@ void RowTable::reserveGap(size_t rows, size_t textSize) {
 }
 
 void RowTable::replace(size_t first, size_t removed, const std::vector<size_t>& newStarts, size_t newTextSize,
-                       size_t oldTextSize) {
+                       size_t oldTextSize, const RowState* states, const int16_t* columns) {
     requireFits(newTextSize);
     // The rows after first+removed keep their offsets from the end; those
     // up to `first` keep theirs from the start.
@@ -226,8 +230,8 @@ void RowTable::replace(size_t first, size_t removed, const std::vector<size_t>& 
     reserveGap(newStarts.size(), newTextSize);
     for (size_t k = 0; k < newStarts.size(); ++k) {
         starts_[gapStart_] = static_cast<uint32_t>(newStarts[k]);
-        states_[gapStart_] = RowState();
-        columns_[gapStart_] = kNoIndentCheck;
+        states_[gapStart_] = states ? states[k] : RowState();
+        columns_[gapStart_] = columns ? columns[k] : kNoIndentCheck;
         ++gapStart_;
     }
 }

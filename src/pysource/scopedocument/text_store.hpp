@@ -50,6 +50,9 @@ public:
     // Where the next '\n' at or after `from` is; size() when there is none.
     size_t findNewline(size_t from) const noexcept;
     size_t bytesHeld() const noexcept { return buf_.capacity(); }
+    // How many '\r' the text holds: without any, its lines split at
+    // '\r\n', '\r' and '\n' are its rows.
+    size_t carriageReturns() const noexcept { return carriageReturns_; }
 
 private:
     void moveGap(size_t pos) noexcept;
@@ -69,6 +72,7 @@ private:
     size_t gapStart_ = 0;       // characters
     size_t gapEnd_ = 0;
     size_t capacity_ = 0;       // characters
+    size_t carriageReturns_ = 0;
 };
 
 // What the reader leaves at the break before a row. Opaque here: the
@@ -101,8 +105,10 @@ public:
     // starting at `newStarts` (offsets in the text after the edit, whose
     // size is `newTextSize`) put in their place; the rows after shift by
     // `delta` characters. States and columns of the new rows are unset.
+    // With `states` and `columns` (one per new row) the new rows take
+    // them; an edit undone puts back what it took out.
     void replace(size_t first, size_t removed, const std::vector<size_t>& newStarts, size_t newTextSize,
-                 size_t oldTextSize);
+                 size_t oldTextSize, const RowState* states = nullptr, const int16_t* columns = nullptr);
     size_t bytesHeld() const noexcept {
         return starts_.capacity() * sizeof(uint32_t) + states_.capacity() * sizeof(RowState) +
                columns_.capacity() * sizeof(int16_t);
