@@ -349,7 +349,8 @@ class CReferenceDocument(object):
         return self._ranges
 
     def _Take(self, text, whole=False):
-        old_lines = self._text.count('\n') + 1
+        # The list follows the last text that read: the region replaces all of it.
+        old_lines = self._baseline_text.count('\n') + 1
         new_lines = text.count('\n') + 1
         self._text, self._ranges = text, None
         self._stats = dict(rows_scanned=new_lines, logicals_made=0)
