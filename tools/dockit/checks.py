@@ -2,8 +2,8 @@
 
 The replay keeps the text itself (a Python string edited by
 textedits.ApplyRange) and, for each call, asks a fresh read of that text
-and a whole-file pass by a new CChangeFinder what the document should
-hold:
+by the reader written in Python (pysource.logicals, reference=True) and a
+whole-file pass by a new CChangeFinder what the document should hold:
 
   text      GetText, GetLineCount and the edited lines equal the kept text;
   logicals  tokens, line numbers, indents, kinds and both names equal the
@@ -25,10 +25,9 @@ hold:
 
 import traceback
 
-from pysource.logicals import ReadLogicals
 from pysource.scopebodycache import CChangeFinder, CScopeBodyCache
 
-from dockit.reference import ErrorFields, Fields, Outline, ScopeAtLine
+from dockit.reference import ErrorFields, Fields, Outline, ReferenceRead, ScopeAtLine
 from replaykit.checks import CacheDiffs, KindLabel, ScopeNames, WarmCache, _Ask, _SameAnswer
 
 kInvariants = ('exception', 'text', 'result', 'error', 'logicals', 'identity', 'cache',
@@ -38,7 +37,7 @@ kInvariants = ('exception', 'text', 'result', 'error', 'logicals', 'identity', '
 def NamedRead(text, filename):
     """(fresh named logicals, None), or (None, the reader's error)."""
     try:
-        lst = ReadLogicals(text, filename)
+        lst = ReferenceRead(text, filename)
     except SyntaxError as exc:
         return None, exc
     CChangeFinder(lst).FindChanges(lst, [])
