@@ -21,7 +21,7 @@ kSamplePath = os.path.join(toolpath.kRepoDir, 'samples', 'outline_sample.py')
 
 def RunReplay(paths, document='native', seed=0, edits_per_file=150, reset_every=50,
               utf16_fraction=0.2, self_check=False, cache_check=True, repro_dir=kDefaultReproDir,
-              max_repros=10, stop_on_failure=False, quiet=False, out=None):
+              max_repros=10, stop_on_failure=False, quiet=False, out=None, ignore=()):
     """Replays `edits_per_file` seeded calls on a document of each file (made
     again from the file's text every `reset_every` calls) and checks each.
     Returns a summary dict; its 'failures' list has one entry per failing call."""
@@ -54,7 +54,7 @@ def RunReplay(paths, document='native', seed=0, edits_per_file=150, reset_every=
 
         def NewSession(text):
             try:
-                made = Session(document_class, text, path, self_check, cache_check)
+                made = Session(document_class, text, path, self_check, cache_check, ignore)
             except Exception:
                 summary['errors'] += 1
                 Say('%s: making the document raised\n%s' % (path, traceback.format_exc()),
@@ -111,7 +111,7 @@ def RunReplay(paths, document='native', seed=0, edits_per_file=150, reset_every=
                 try:
                     repro, text, note = WriteReproducer(
                         repro_dir, stem, document_class, document, history, invariant, where,
-                        self_check=self_check, cache_check=cache_check)
+                        self_check=self_check, cache_check=cache_check, ignore=ignore)
                     failure['repro'] = repro
                     Say('    reproducer: %s (%s)' % (repro, note), always=True)
                     shown = text.splitlines()
@@ -195,6 +195,8 @@ def _ParseArgs(argv):
                         help='where reproducers go (default %s)' % kDefaultReproDir)
     parser.add_argument('--max-repros', type=int, default=10, metavar='N',
                         help='shrink and write at most N reproducers (default 10)')
+    parser.add_argument('--ignore', action='append', default=[], metavar='INVARIANT',
+                        help='do not count disagreements of INVARIANT (e.g. region; repeatable)')
     parser.add_argument('--quiet', action='store_true', help='print only failures and the summary')
     return parser.parse_args(argv)
 
@@ -219,6 +221,7 @@ def main(argv=None):
                         reset_every=args.reset_every, utf16_fraction=args.utf16_fraction,
                         self_check=args.self_check, cache_check=args.cache_check,
                         repro_dir=args.repro_dir, max_repros=args.max_repros,
-                        stop_on_failure=args.stop_on_failure, quiet=args.quiet)
+                        stop_on_failure=args.stop_on_failure, quiet=args.quiet,
+                        ignore=frozenset(args.ignore))
     sys.stdout.write('\n'.join(FormatSummary(summary)) + '\n')
     return 1 if Failed(summary) else 0

@@ -1,7 +1,8 @@
 """CReferenceDocument: a document that follows text edits the way callers
 work today.
 
-Every edit re-reads the whole text with ReadLogicals, and the live list
+Every edit re-reads the whole text with ReadLogicals (the reader written in
+Python, whatever ReadLogicals reads with by default), and the live list
 follows the fresh reading by its common prefix and suffix
 (replaykit.editor.FollowOneChange) before one FindChanges call. It has the
 interface of pysource.scopedocument.CScopeDocument, so it is the whole-text
@@ -43,6 +44,20 @@ else:
 _kUtf8Bom = b'\xef\xbb\xbf'
 
 
+def _HasReferenceReader():
+    code = ReadLogicals.__code__
+    return 'reference' in code.co_varnames[:code.co_argcount]
+
+
+if _HasReferenceReader():
+    def ReferenceRead(text, filename='<string>'):
+        """The logicals of `text` by the reader written in Python, whatever
+        ReadLogicals reads with by default."""
+        return ReadLogicals(text, filename, reference=True)
+else:
+    ReferenceRead = ReadLogicals
+
+
 # --- Text ----------------------------------------------------------------------
 
 def _Decoded(data, filename):
@@ -55,7 +70,7 @@ def _Decoded(data, filename):
         text = data.decode(encoding)
     except (SyntaxError, LookupError, UnicodeDecodeError):
         # The reader words the error: it fails the same way on the same bytes.
-        ReadLogicals(data, filename)
+        ReferenceRead(data, filename)
         raise SyntaxError('cannot decode the text', (filename, 1, None, None))
     if data.startswith(_kUtf8Bom) and not text.startswith(u'\ufeff'):
         text = u'\ufeff' + text
@@ -273,7 +288,7 @@ def Differences(lst, text, filename, error, limit=5):
     """How (lst, error) differ from a fresh read of `text` and a whole-file
     pass, as lines; [] when they agree. `error` is what the document reports."""
     try:
-        fresh = ReadLogicals(text, filename)
+        fresh = ReferenceRead(text, filename)
     except SyntaxError as exc:
         if ErrorFields(error) != ErrorFields(exc):
             return ['the text does not read: expected %r, got %r' % (
@@ -297,7 +312,10 @@ def Differences(lst, text, filename, error, limit=5):
 
 class CReferenceDocument(object):
     """Logicals, scope names and a body cache that follow a text through
-    edits; every edit re-reads the whole text (see the module's docstring)."""
+    edits; every edit re-reads the whole text (see the module's docstring)
+    with the reader written in Python."""
+
+    Read = staticmethod(ReferenceRead)
 
     def __init__(self, text, filename='<string>'):
         if not isinstance(filename, str) and not (_kPy2 and isinstance(filename, _kOtherText)):
@@ -349,12 +367,13 @@ class CReferenceDocument(object):
         return self._ranges
 
     def _Take(self, text, whole=False):
-        old_lines = self._text.count('\n') + 1
+        # The list follows the last text that read: the region replaces all of it.
+        old_lines = self._baseline_text.count('\n') + 1
         new_lines = text.count('\n') + 1
         self._text, self._ranges = text, None
         self._stats = dict(rows_scanned=new_lines, logicals_made=0)
         try:
-            fresh = ReadLogicals(text, self._filename)
+            fresh = self.Read(text, self._filename)
         except SyntaxError as exc:
             self._error = exc
             return CEditResult(fAdded=[], fRemoved=[], fContentsChanges=set(),
@@ -433,7 +452,7 @@ class CReferenceDocument(object):
 
     def __reduce__(self):
         return (_Rebuilt, (self._text, self._filename, self._baseline_text,
-                           [Fields(l) for l in self._lst]))
+                           [Fields(l) for l in self._lst], type(self)))
 
     def __copy__(self):
         return _Rebuilt(*self.__reduce__()[1])
@@ -442,8 +461,9 @@ class CReferenceDocument(object):
         return self.__copy__()
 
 
-def _Rebuilt(text, filename, baseline_text, fields):
-    doc = CReferenceDocument.__new__(CReferenceDocument)
+def _Rebuilt(text, filename, baseline_text, fields, cls=None):
+    cls = cls or CReferenceDocument
+    doc = cls.__new__(cls)
     lst = []
     for tokens, lineno, indent, kind, scope, local in fields:
         l = LogicalLineType(tokens, lineno, indent, kind)
@@ -455,3 +475,9 @@ def _Rebuilt(text, filename, baseline_text, fields):
         doc._Take(text)
     return doc
 
+
+class CNativeReadDocument(CReferenceDocument):
+    """The same pipeline with ReadLogicals as it reads by default (natively
+    where pysource._reader is built)."""
+
+    Read = staticmethod(ReadLogicals)

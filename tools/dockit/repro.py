@@ -24,11 +24,11 @@ def DocumentClass(name):
 
 
 def RunOps(document_class, start_text, ops, filename='<string>', self_check=False,
-           cache_check=True):
+           cache_check=True, ignore=()):
     """(index of the failing call, -1 for the creation, Problems), or None
     when every call agrees."""
     try:
-        session = Session(document_class, start_text, filename, self_check, cache_check)
+        session = Session(document_class, start_text, filename, self_check, cache_check, ignore)
     except Exception:
         import traceback
         problems = Problems()
@@ -66,7 +66,7 @@ def _DropLine(text, ops, j):
 
 
 def Shrink(document_class, history, invariant, filename='<string>', self_check=False,
-           cache_check=True, max_attempts=250):
+           cache_check=True, ignore=(), max_attempts=250):
     """A smaller (start text, ops) that still fails with `invariant`, from
     `history`: the (text before, op) of each call up to the failing one."""
     attempts = [0]
@@ -75,7 +75,7 @@ def Shrink(document_class, history, invariant, filename='<string>', self_check=F
         if attempts[0] >= max_attempts:
             return None
         attempts[0] += 1
-        got = RunOps(document_class, text, ops, filename, self_check, cache_check)
+        got = RunOps(document_class, text, ops, filename, self_check, cache_check, ignore)
         if got is None or got[1].invariant != invariant:
             return None
         return ops[:got[0] + 1]
@@ -131,21 +131,22 @@ OPS = [
 %(ops)s]
 
 if __name__ == '__main__':
-    sys.exit(Reproduce(START, OPS, %(document)r, self_check=%(self_check)r))
+    sys.exit(Reproduce(START, OPS, %(document)r, self_check=%(self_check)r, ignore=%(ignore)r))
 '''
 
 
-def FormatReproducer(start, ops, title, where, path, document, self_check):
+def FormatReproducer(start, ops, title, where, path, document, self_check, ignore=()):
     return _kTemplate % dict(
         title=title, where=where, path=path, tools=kToolsDir, document=document,
         version='%d.%d' % sys.version_info[:2], start=_TextLiteral('START', start),
-        ops=''.join('    %r,\n' % op for op in ops), self_check=bool(self_check))
+        ops=''.join('    %r,\n' % op for op in ops), self_check=bool(self_check),
+        ignore=sorted(ignore))
 
 
-def Reproduce(start, ops, document='native', self_check=False):
+def Reproduce(start, ops, document='native', self_check=False, ignore=()):
     """A reproducer's body: replays the calls and prints what disagrees;
     returns its exit status."""
-    got = RunOps(DocumentClass(document), start, ops, self_check=self_check)
+    got = RunOps(DocumentClass(document), start, ops, self_check=self_check, ignore=ignore)
     if got is None:
         print('no disagreements')
         return 0
@@ -157,18 +158,18 @@ def Reproduce(start, ops, document='native', self_check=False):
 
 
 def WriteReproducer(repro_dir, stem, document_class, document, history, invariant, where,
-                    filename='<string>', self_check=False, cache_check=True):
+                    filename='<string>', self_check=False, cache_check=True, ignore=()):
     """Shrinks the failing calls and writes a reproducer. Returns (path,
     its text, a note)."""
     start, ops, attempts = Shrink(document_class, history, invariant, filename, self_check,
-                                  cache_check)
+                                  cache_check, ignore)
     note = 'shrunk in %d tries to %d calls on %d lines' % (attempts, len(ops),
                                                            start.count('\n') + 1)
     if not os.path.isdir(repro_dir):
         os.makedirs(repro_dir)
     path = os.path.join(repro_dir, stem + '.py')
     title = '%s: %s' % (', '.join(op.Describe() for op in ops[-3:]), invariant)
-    text = FormatReproducer(start, ops, title, where, path, document, self_check)
+    text = FormatReproducer(start, ops, title, where, path, document, self_check, ignore)
     with open(path, 'w') as f:
         f.write(text)
     return path, text, note
