@@ -10,6 +10,7 @@ and take their new line numbers, and only those between are worked out
 from their lines again.
 """
 
+import bisect
 import json
 import re
 import sys
@@ -87,6 +88,7 @@ class COutlineJson(object):
     def __init__(self, encoding):
         self._encoding = encoding
         self._outline = None
+        self._headers = []      # the header line of each symbol, for bisect
         self._count = 0         # the line count at the build, then after each edit
         self._built_count = 0
         self._same_top = 0
@@ -121,12 +123,12 @@ class COutlineJson(object):
             return self._Joined()
         count = doc.GetLineCount()
         if self._outline is None or count != self._count:
-            self._Build(doc, outline, count, None)
-        elif count == self._built_count and outline == self._outline and \
+            self._Build(doc, outline, count)
+        elif count == self._built_count and (outline is self._outline or outline == self._outline) and \
                 count - self._same_bottom - self._same_top <= kMaxDirtyLines:
             self._Rewrite(doc, outline, count)
         else:
-            self._Build(doc, outline, count, self._Reusable(outline, count))
+            self._Update(doc, outline, count)
         self._same_top = self._same_bottom = self._built_count = self._count = count
         self._fresh = True
         return self._Joined()
@@ -149,56 +151,88 @@ class COutlineJson(object):
             self._templates[i] = self._Template(doc, outline[i], count, self._in_class[i])
             if self._templates[i][1] != old_span:
                 self._by_line = None
-            self._pieces[i] = self._prefixes[i] + self._Fill(i, outline[i])
+            self._pieces[i] = self._prefixes[i] + _Fill(self._templates[i], outline[i])
         self.stats['rewritten'] += len(redo)
 
-    def _Reusable(self, outline, count):
-        """Per symbol of `outline`, the index of its template at the build,
-        or -1: matched from the start and from the end of both outlines."""
+    def _Update(self, doc, outline, count):
+        """After edits that moved lines or changed the outline: the symbols
+        whose header lines lie above the edited lines keep their pieces (an
+        enclosing one whose end moved takes its new end), those below keep
+        their templates and take their new line numbers, and those between
+        are worked out from their lines."""
         old = self._outline
-        top, bottom = self._same_top, self._same_bottom
+        templates, prefixes, in_classes, pieces = (
+            self._templates, self._prefixes, self._in_class, self._pieces)
+        top = self._same_top
         shift = count - self._built_count
-        old_count = self._built_count
-        old_bottom = old_count - bottom  # old lines after this one are unchanged
-
-        def Map(line):
-            if line <= top:
-                return line
-            if line > old_bottom:
-                return line + shift
-            return None
-
-        def Same(name, kind, header, end, span, new):
-            # The header's lines through the name's all untouched, and the end line.
-            return (new[0] == name and new[1] == kind and Map(header) == new[2] and
-                    (header <= top) == (header + span <= top) and
-                    Map(header + span) == new[2] + span and Map(end) == new[3])
-
-        reuse = [-1] * len(outline)
-        n = min(len(old), len(outline))
-        i = 0
-        while i < n:
-            name, kind, header, end = old[i]
-            new = outline[i]
-            span = self._templates[i][1]
-            if not Same(name, kind, header, end, span, new):
-                break
-            reuse[i] = i
-            i += 1
-        j = 1
-        while j <= n - i:
-            name, kind, header, end = old[-j]
-            new = outline[-j]
-            span = self._templates[-j][1]
-            if not Same(name, kind, header, end, span, new):
-                break
-            reuse[-j] = len(old) - j
-            j += 1
-        return reuse
-
-    def _Build(self, doc, outline, count, reuse):
-        old_templates, old_in_class = self._templates, self._in_class
+        changed_to = self._built_count - self._same_bottom  # old lines after it are untouched
+        n_old, n_new = len(old), len(outline)
+        lead = bisect.bisect_right(self._headers, top)
+        while lead and old[lead - 1][2] + templates[lead - 1][1] > top:
+            lead -= 1
+        trail = n_old - bisect.bisect_right(self._headers, changed_to)
+        if lead + trail > n_new or (lead and outline[lead - 1][0] != old[lead - 1][0]) or \
+                (trail and outline[n_new - trail][2] != old[n_old - trail][2] + shift):
+            self._Build(doc, outline, count)  # not as the edits' places say: all afresh
+            return
+        made = 0
+        new_templates, new_prefixes = templates[:lead], prefixes[:lead]
+        new_in_class, new_pieces = in_classes[:lead], pieces[:lead]
+        # Those around the edits: their end is below the untouched top.
+        for k in [k for k in range(lead) if old[k][3] > top or outline[k] != old[k]]:
+            entry, end = outline[k], old[k][3]
+            if not (end > changed_to and entry[3] == end + shift and entry[0] == old[k][0]):
+                new_templates[k] = self._Template(doc, entry, count, new_in_class[k])
+                made += 1
+            new_pieces[k] = new_prefixes[k] + _Fill(new_templates[k], entry)
+        # Those after, walked as a whole build walks them from the scopes
+        # open after the lead; those below the edits keep their templates
+        # when they keep their name, kind and class.
+        stack = _OpenAfter(outline, lead - 1)
+        first_trail = n_new - trail
+        below = n_old - n_new
+        for k in range(lead, n_new):
+            entry = outline[k]
+            name = entry[0]
+            parent = name.rpartition('.')[0]
+            closed = 0
+            while stack and stack[-1][0] != parent:
+                stack.pop()
+                closed += 1
+            prefix = _kPrefixes[closed] if closed < 64 else ']}' * closed + ','
+            in_class = bool(stack) and stack[-1][1] == kClassKind
+            stack.append((name, entry[1]))
+            if k >= first_trail:
+                o = k + below
+                was = old[o]
+                if name == was[0] and entry[1] == was[1] and in_class == in_classes[o] and \
+                        entry[3] == was[3] + shift:
+                    new_templates.append(templates[o])
+                    new_prefixes.append(prefix)
+                    new_in_class.append(in_class)
+                    if shift == 0 and prefix is prefixes[o]:
+                        new_pieces.append(pieces[o])
+                    else:
+                        new_pieces.append(prefix + _Fill(templates[o], entry))
+                    continue
+            template = self._Template(doc, entry, count, in_class)
+            made += 1
+            new_templates.append(template)
+            new_prefixes.append(prefix)
+            new_in_class.append(in_class)
+            new_pieces.append(prefix + _Fill(template, entry))
+        self._tail = ']}' * len(stack)
         self._outline = outline
+        self._headers = [entry[2] for entry in outline]
+        self._templates, self._prefixes = new_templates, new_prefixes
+        self._in_class, self._pieces = new_in_class, new_pieces
+        self._by_line = None
+        self.stats['aligned'] += 1
+        self.stats['rewritten'] += made
+
+    def _Build(self, doc, outline, count):
+        self._outline = outline
+        self._headers = [entry[2] for entry in outline]
         self._templates = templates = []
         self._prefixes = prefixes = []
         self._in_class = in_classes = []
@@ -206,7 +240,6 @@ class COutlineJson(object):
         self._by_line = None
         kinds = {}
         stack = []
-        made = 0
         for i, entry in enumerate(outline):
             name, kind, header, end = entry
             parent = name.rpartition('.')[0]
@@ -218,26 +251,15 @@ class COutlineJson(object):
             in_class = kinds.get(parent) == kClassKind if stack else False
             kinds[name] = kind
             stack.append(name)
-            k = reuse[i] if reuse is not None else -1
-            if k >= 0 and old_in_class[k] == in_class:
-                template = old_templates[k]
-            else:
-                template = self._Template(doc, entry, count, in_class)
-                made += 1
+            template = self._Template(doc, entry, count, in_class)
             templates.append(template)
             prefixes.append(prefix)
             in_classes.append(in_class)
-            line = header - 1
-            name_line = line + template[1]
-            pieces.append(prefix + template[0] % (line, end - 1, name_line, name_line))
+            pieces.append(prefix + _Fill(template, entry))
         self._tail = ']}' * len(stack)
-        self.stats['built' if reuse is None else 'aligned'] += 1
-        self.stats['rewritten'] += made
+        self.stats['built'] += 1
+        self.stats['rewritten'] += len(outline)
 
-    def _Fill(self, i, entry):
-        template, span = self._templates[i]
-        line = entry[2] - 1
-        return template % (line, entry[3] - 1, line + span, line + span)
 
     def _Template(self, doc, entry, count, in_class):
         """(the symbol's JSON with its line numbers left as %d, where its
@@ -271,6 +293,31 @@ class COutlineJson(object):
             _JsonString(bare).replace('%', '%%'), _JsonString(name).replace('%', '%%'), symbol_kind,
             indent, end_col, start, stop)
         return template, name_line - header_line
+
+
+def _Fill(template, entry):
+    """A symbol's piece: its template with the line numbers of `entry`."""
+    line = entry[2] - 1
+    name_line = line + template[1]
+    return template[0] % (line, entry[3] - 1, name_line, name_line)
+
+
+def _OpenAfter(outline, k):
+    """The (name, kind) of the symbols still open after outline[k]: it and
+    its enclosing ones, found back up the list."""
+    if k < 0:
+        return []
+    name, kind = outline[k][0], outline[k][1]
+    chain = [(name, kind)]
+    want = name.rpartition('.')[0]
+    k -= 1
+    while want and k >= 0:
+        if outline[k][0] == want:
+            chain.append((want, outline[k][1]))
+            want = want.rpartition('.')[0]
+        k -= 1
+    chain.reverse()
+    return chain
 
 
 def FoldingJson(outline):

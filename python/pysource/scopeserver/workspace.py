@@ -27,6 +27,24 @@ class CChange(object):
         self.start, self.end, self.text = start, end, text
 
 
+def _OutlineKept(result):
+    """Whether an edit of a text that read left the outline as it was: the
+    text reads, no line came or went, and every logical put in stands where
+    the one taken out stood, of its kind and in its scope, none a class or
+    a def (so no scope starts, ends or is named otherwise)."""
+    added, removed = result.fAdded, result.fRemoved
+    if not result.fReadable or result.fRegion[1] != result.fRegion[2] or len(added) != len(removed):
+        return False
+    for new, old in zip(added, removed):
+        if new.fLineno != old.fLineno or new.fKind != old.fKind or new.fKind in _kScopeKinds or \
+                new.fScopeName != old.fScopeName:
+            return False
+    return True
+
+
+_kScopeKinds = (symbols.kClassKind, symbols.kDefKind)
+
+
 def _LineCountOf(text):
     return text.count('\n') + 1
 
@@ -176,18 +194,20 @@ class COpenDocument(object):
 
     def _EditAll(self, edits):
         doc = self.doc
+        readable = doc.IsReadable()
         if edits[0][0] is None:
             old_count = doc.GetLineCount()
-            doc.SetText(edits[0][1])
+            result = doc.SetText(edits[0][1])
             self._symbols.NoteEdit(1, old_count, doc.GetLineCount())
         else:
             if len(edits) == 1:
-                doc.Edit(*edits[0])
+                result = doc.Edit(*edits[0])
             else:
-                doc.EditMany(edits)
+                result = doc.EditMany(edits)
             for edit in edits:
                 self._symbols.NoteEdit(edit[0], edit[2], edit[4].count('\n') + 1)
-        self._outline = None
+        if not (readable and _OutlineKept(result)):
+            self._outline = None
 
     # --- Answers -----------------------------------------------------------------
 
