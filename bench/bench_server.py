@@ -93,13 +93,22 @@ def TypingPlace(text):
     return n, 8
 
 
-def Edits(place, k):
+def _Change(l1, c1, l2, c2, text):
+    return {'range': {'start': {'line': l1, 'character': c1}, 'end': {'line': l2, 'character': c2}},
+            'text': text}
+
+
+def Edits(place, k, enter=False):
+    """Sample k's change: a character typed (or with `enter` a line broken)
+    at `place`, then taken out again by the next sample."""
     line, col = place
+    if enter:
+        if k % 2 == 0:
+            return [_Change(line, col, line, col, '\n' + ' ' * col)]
+        return [_Change(line, col, line + 1, col, '')]
     if k % 2 == 0:
-        return [{'range': {'start': {'line': line, 'character': col}, 'end': {'line': line, 'character': col}},
-                 'text': 'x'}]
-    return [{'range': {'start': {'line': line, 'character': col}, 'end': {'line': line, 'character': col + 1}},
-             'text': ''}]
+        return [_Change(line, col, line, col, 'x')]
+    return [_Change(line, col, line, col + 1, '')]
 
 
 def Percentiles(values):
@@ -183,6 +192,12 @@ class CPipeClient(object):
             self.proc.wait()
 
 
+def Started(cmd, env):
+    client = CPipeClient(cmd, env)
+    Initialize(client, pylsp=False)
+    return client
+
+
 def Initialize(client, pylsp):
     caps = {'textDocument': {'documentSymbol': {'hierarchicalDocumentSymbolSupport': True}}}
     client.Request('initialize', {'processId': os.getpid(), 'rootUri': 'file:///bench',
@@ -192,7 +207,7 @@ def Initialize(client, pylsp):
         client.Send('workspace/didChangeConfiguration', {'settings': kPylspSettings})
 
 
-def RoundTrips(client, text, place, samples, timeout=None, budget=None):
+def RoundTrips(client, text, place, samples, timeout=None, budget=None, enter=False):
     """(wall times, server CPU per round trip, JSON size, the first symbols' time)."""
     client.Send('textDocument/didOpen', {'textDocument': {
         'uri': kUri, 'languageId': 'python', 'version': 1, 'text': text}})
@@ -205,7 +220,7 @@ def RoundTrips(client, text, place, samples, timeout=None, budget=None):
     for k in range(samples):
         start = time.perf_counter()
         client.Send('textDocument/didChange', {'textDocument': {'uri': kUri, 'version': k + 2},
-                                               'contentChanges': Edits(place, k)})
+                                               'contentChanges': Edits(place, k, enter)})
         try:
             body = client.Request('textDocument/documentSymbol', {'textDocument': {'uri': kUri}},
                                   timeout=timeout)
@@ -222,7 +237,7 @@ def RoundTrips(client, text, place, samples, timeout=None, budget=None):
     return times, cpu, (len(body), len(answer), decode * 1e3), first
 
 
-def Parts(text, place, samples):
+def Parts(text, place, samples, enter=False):
     """The scope server's parts of a round trip, in-process, and what its
     answers' state holds beyond the document (bytes)."""
     sent = []
@@ -241,7 +256,7 @@ def Parts(text, place, samples):
     parts = dict(edit=[], outline=[], json=[], response=[])
     for k in range(samples):
         body = json.dumps({'jsonrpc': '2.0', 'method': 'textDocument/didChange', 'params': {
-            'textDocument': {'uri': kUri, 'version': k + 2}, 'contentChanges': Edits(place, k)}}).encode()
+            'textDocument': {'uri': kUri, 'version': k + 2}, 'contentChanges': Edits(place, k, enter)}}).encode()
         t0 = time.perf_counter()
         server.HandleBody(body)
         t1 = time.perf_counter()
@@ -285,8 +300,7 @@ def Main():
         lines = text.count('\n')
         place = TypingPlace(text)
         print('\n%s: %d lines, typing at line %d' % (label, lines, place[0] + 1))
-        ours = CPipeClient(ours_cmd, env)
-        Initialize(ours, pylsp=False)
+        ours = Started(ours_cmd, env)
         rss_empty = ours.Rss()
         times, cpu, size, first = RoundTrips(ours, text, place, args.samples)
         rss = ours.Rss()
@@ -302,6 +316,12 @@ def Main():
               'answers\' state %.0f KiB beyond the document (document besides its logicals: %s)' % (
                   rss_empty / 2.0 ** 20, rss / 2.0 ** 20, held / 1024.0,
                   ', '.join('%s %.0f KiB' % (k, v / 1024.0) for k, v in sorted(own.items())) or '-'))
+        etimes, ecpu, _, _ = RoundTrips(Started(ours_cmd, env), text, place, args.samples, enter=True)
+        eparts = Parts(text, place, min(args.samples, 100), enter=True)[0]
+        print('  scope server, a line broken instead (Enter; every line below moves): round trip %s, '
+              'server CPU %.2f ms' % (Ms(etimes), ecpu * 1e3))
+        for name in ('edit', 'outline', 'json', 'response'):
+            print('    %-9s %s' % (name, Ms(eparts[name])))
         row = dict(label=label, lines=lines, ours=times, ours_cpu=cpu, parts=parts)
         if have_pylsp:
             samples = args.pylsp_samples if lines < 20000 else args.pylsp_large_samples
