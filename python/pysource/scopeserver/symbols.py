@@ -191,7 +191,10 @@ class COutlineJson(object):
         stack = _OpenAfter(outline, lead - 1)
         first_trail = n_new - trail
         below = n_old - n_new
-        for k in range(lead, n_new):
+        stop = n_new
+        if trail > 1 and self._SameBelow(outline, first_trail, lead, shift):
+            stop = first_trail + 1  # the rest, below, in bulk
+        for k in range(lead, stop):
             entry = outline[k]
             name = entry[0]
             parent = name.rpartition('.')[0]
@@ -221,6 +224,21 @@ class COutlineJson(object):
             new_prefixes.append(prefix)
             new_in_class.append(in_class)
             new_pieces.append(prefix + _Fill(template, entry))
+        if stop < n_new:
+            # Below the edits every symbol keeps its name, kind, class and
+            # place among the others: its prefix and template, new numbers.
+            rest = slice(stop + below, n_old)
+            new_templates.extend(templates[rest])
+            new_prefixes.extend(prefixes[rest])
+            new_in_class.extend(in_classes[rest])
+            if shift:
+                new_pieces.extend([prefix + template % (entry[2] - 1, entry[3] - 1, entry[2] - 1 + span,
+                                                        entry[2] - 1 + span)
+                                   for prefix, (template, span), entry in
+                                   zip(prefixes[rest], templates[rest], outline[stop:])])
+            else:
+                new_pieces.extend(pieces[rest])
+            stack = _OpenAfter(outline, n_new - 1)
         self._tail = ']}' * len(stack)
         self._outline = outline
         self._headers = [entry[2] for entry in outline]
@@ -229,6 +247,18 @@ class COutlineJson(object):
         self._by_line = None
         self.stats['aligned'] += 1
         self.stats['rewritten'] += made
+
+    def _SameBelow(self, outline, first_trail, lead, shift):
+        """Whether the symbols after the first one below the edits are those
+        of the build, each moved by `shift`, and the ones between the lead
+        and them too, as (name, kind): then no symbol below changed its
+        name, kind, parent's kind or place among the others."""
+        old = self._outline
+        first_old = first_trail + len(old) - len(outline)
+        if [e[:2] for e in outline[lead:first_trail]] != [e[:2] for e in old[lead:first_old]]:
+            return False
+        return all(a[0] == b[0] and a[1] == b[1] and a[3] == b[3] + shift
+                   for a, b in zip(outline[first_trail + 1:], old[first_old + 1:]))
 
     def _Build(self, doc, outline, count):
         self._outline = outline
