@@ -221,6 +221,17 @@ class OutlineTest(unittest.TestCase):
             self.Check(client)
             self.assertEqual(client.Text(), '# ' + text.replace('    def', '    x = ()def', 1))
 
+    def testOpenedUnreadable(self):
+        client = CClient()
+        sent = client.Open('class A:\n    def f(self, x:\n')
+        self.assertEqual([m['method'] for m in sent], ['textDocument/publishDiagnostics'])
+        self.assertEqual(sent[0]['params']['version'], 1)
+        self.assertEqual(client.Symbols(), [])  # no text has read yet
+        self.assertEqual(client.Folding(), [])
+        sent = client.Change([Change(1, 17, 1, 17, ')')])
+        self.assertEqual(sent[0]['params']['diagnostics'], [])
+        self.Check(client)
+
     def testScopeAtAndHover(self):
         client = CClient()
         client.Open('class A:\n    def f(self):\n        return 1\nx = 2\n')
@@ -246,6 +257,7 @@ class OutlineTest(unittest.TestCase):
             ([Change(2, 16, 2, 16, '\n        x = 2')], 1),         # Enter: A and f end later
             ([Change(0, 0, 0, 0, 'import os\n')], 1),              # all move down (A's header edited)
             ([Change(8, 0, 8, 0, '\n\n')], 0),                      # all below move down
+            ([Change(0, 0, 0, 8, 'def A():\n')], 3),               # A a function: f, g no methods
             ([Change(9, 0, 9, 0, 'def k():\n    pass\n')], 2),     # k added, on B's first line
             ([Change(12, 0, 14, 0, '')], 1),                       # h removed: B ends earlier
             ([Change(0, 6, 0, 7, 'C'), Change(9, 6, 9, 7, 'D')], 5),  # both classes renamed: all names
@@ -327,6 +339,13 @@ class BadInputTest(unittest.TestCase):
         before = len(client.sent)
         client.server.HandleBodies(bodies)
         return [json.loads(m).get('error', {}).get('code') for m in client.sent[before:]]
+
+    def testAnswersKeepTheOrderOfTheMessages(self):
+        client = CClient()
+        bodies = [b'{"jsonrpc": "2.0", "id": 1, "method": "shutdown"}', b'{"bad',
+                  b'{"jsonrpc": "2.0", "id": 2, "method": "shutdown"}']
+        client.server.HandleBodies(bodies)
+        self.assertEqual([json.loads(m).get('id') for m in client.sent[-3:]], [1, None, 2])
 
     def testMalformedMessagesAreAnsweredAndTheServerGoesOn(self):
         client = CClient()

@@ -77,8 +77,8 @@ class CScopeServer(object):
     # --- Messages ----------------------------------------------------------------
 
     def HandleBodies(self, bodies):
-        """Handles the bodies read together; a request cancelled by a later
-        one of them is answered RequestCancelled without being run."""
+        """Handles the bodies read together, in order; a request cancelled
+        by a later one of them is answered RequestCancelled without being run."""
         messages = [self._Decode(body) for body in bodies]
         cancelled = set()
         for msg in messages:
@@ -87,26 +87,25 @@ class CScopeServer(object):
                 if isinstance(params, dict) and protocol.IsId(params.get('id')):
                     cancelled.add(params['id'])
         for msg in messages:
-            if msg is _kUndecodable:
-                continue
-            if cancelled and isinstance(msg, dict) and 'method' in msg \
-                    and protocol.IsId(msg.get('id')) and msg['id'] in cancelled:
-                self._send(protocol.ErrorResponse(msg['id'], protocol.kRequestCancelled,
-                                                  'cancelled'))
-                continue
-            self.HandleMessage(msg)
+            if isinstance(msg, _CUndecodable):
+                self._send(protocol.ErrorResponse(None, protocol.kParseError, msg.reason))
+            elif cancelled and isinstance(msg, dict) and 'method' in msg and \
+                    protocol.IsId(msg.get('id')) and msg['id'] in cancelled:
+                self._send(protocol.ErrorResponse(msg['id'], protocol.kRequestCancelled, 'cancelled'))
+            else:
+                self.HandleMessage(msg)
             if self.exit_code is not None:
                 break
 
     def HandleBody(self, body):
         self.HandleBodies([body])
 
-    def _Decode(self, body):
+    @staticmethod
+    def _Decode(body):
         try:
             return json.loads(body.decode('utf-8'))
         except Exception as exc:  # not UTF-8, not JSON, nested past the recursion limit
-            self._send(protocol.ErrorResponse(None, protocol.kParseError, 'not JSON: %s' % exc))
-            return _kUndecodable
+            return _CUndecodable('not JSON: %s' % exc)
 
     def HandleMessage(self, msg):
         if not isinstance(msg, dict):
@@ -337,7 +336,11 @@ class CScopeServer(object):
         return {'contents': {'kind': 'plaintext', 'value': text}}
 
 
-_kUndecodable = object()
+class _CUndecodable(object):
+    """A body that is not JSON, and why."""
+
+    def __init__(self, reason):
+        self.reason = reason
 
 
 def Serve(infd, outstream, server_factory=CScopeServer, **kwargs):
