@@ -238,21 +238,9 @@ def RoundTrips(client, text, place, samples, timeout=None, budget=None, enter=Fa
 
 
 def Parts(text, place, samples, enter=False):
-    """The scope server's parts of a round trip, in-process, and what its
-    answers' state holds beyond the document (bytes)."""
-    sent = []
-    server = CScopeServer(sent.append, log=open(os.devnull, 'w'))
-    server.HandleMessage({'jsonrpc': '2.0', 'id': 0, 'method': 'initialize', 'params': {'capabilities': {}}})
-    tracemalloc.start()
-    server.HandleMessage({'jsonrpc': '2.0', 'method': 'textDocument/didOpen', 'params': {'textDocument': {
-        'uri': kUri, 'languageId': 'python', 'version': 1, 'text': text}}})
+    """The scope server's parts of a round trip, in-process, and the server."""
+    server = _Opened(text)
     opened = server.documents[kUri]
-    base = tracemalloc.get_traced_memory()[0]
-    opened.SymbolsJson()
-    opened.FoldingJson()
-    opened.ScopeAt(0)
-    held = tracemalloc.get_traced_memory()[0] - base
-    tracemalloc.stop()
     parts = dict(edit=[], outline=[], json=[], response=[])
     for k in range(samples):
         body = json.dumps({'jsonrpc': '2.0', 'method': 'textDocument/didChange', 'params': {
@@ -268,7 +256,36 @@ def Parts(text, place, samples, enter=False):
         t4 = time.perf_counter()
         for name, value in zip(('edit', 'outline', 'json', 'response'), (t1 - t0, t2 - t1, t3 - t2, t4 - t3)):
             parts[name].append(value)
-    return parts, held, opened.doc
+    return parts, opened.doc
+
+
+def _Opened(text):
+    server = CScopeServer(lambda text: None, log=open(os.devnull, 'w'))
+    server.HandleMessage({'jsonrpc': '2.0', 'id': 0, 'method': 'initialize', 'params': {'capabilities': {}}})
+    server.HandleMessage({'jsonrpc': '2.0', 'method': 'textDocument/didOpen', 'params': {'textDocument': {
+        'uri': kUri, 'languageId': 'python', 'version': 1, 'text': text}}})
+    return server
+
+
+def Held(text, place):
+    """Bytes the server holds for an open document beyond the document
+    itself, once it has answered symbols, folding ranges and a scope after
+    a typed character and a line break (traced allocations)."""
+    tracemalloc.start()
+    server = _Opened(text)
+    opened = server.documents[kUri]
+    opened.Outline()  # the document's own, made when first asked
+    base = tracemalloc.get_traced_memory()[0]
+    for k, enter in ((0, False), (1, False), (0, True), (1, True)):
+        server.HandleMessage({'jsonrpc': '2.0', 'method': 'textDocument/didChange', 'params': {
+            'textDocument': {'uri': kUri, 'version': k + 2 + 2 * enter},
+            'contentChanges': Edits(place, k, enter)}})
+        opened.SymbolsJson()
+        opened.FoldingJson()
+        opened.ScopeAt(place[0])
+    held = tracemalloc.get_traced_memory()[0] - base
+    tracemalloc.stop()
+    return held, len(opened.Outline())
 
 
 def Main():
@@ -308,13 +325,15 @@ def Main():
         print('  scope server: round trip %s, server CPU %.2f ms, first answer %.0f ms' % (
             Ms(times), cpu * 1e3, first * 1e3))
         print('    answer: %d bytes, %d top-level symbols; the client decodes it in %.1f ms (not in the round trip)' % size)
-        parts, held, doc = Parts(text, place, min(args.samples, 100))
+        parts, doc = Parts(text, place, min(args.samples, 100))
+        held, symbols = Held(text, place)
         for name in ('edit', 'outline', 'json', 'response'):
             print('    %-9s %s' % (name, Ms(parts[name])))
         own = getattr(doc, '_MemoryUse', lambda: {})()
         print('  memory: server RSS %.1f MiB with no document, %.1f MiB with it open; '
-              'answers\' state %.0f KiB beyond the document (document besides its logicals: %s)' % (
-                  rss_empty / 2.0 ** 20, rss / 2.0 ** 20, held / 1024.0,
+              'the answers\' state %.0f KiB beyond the document (%.0f bytes a symbol, %d symbols; '
+              'the document besides its logicals: %s)' % (
+                  rss_empty / 2.0 ** 20, rss / 2.0 ** 20, held / 1024.0, held / max(1, symbols), symbols,
                   ', '.join('%s %.0f KiB' % (k, v / 1024.0) for k, v in sorted(own.items())) or '-'))
         etimes, ecpu, _, _ = RoundTrips(Started(ours_cmd, env), text, place, args.samples, enter=True)
         eparts = Parts(text, place, min(args.samples, 100), enter=True)[0]

@@ -331,6 +331,13 @@ class PositionsTest(unittest.TestCase):
         self.assertEqual(client.Text(), 'class A:  # y\r\n    def f(self):\r\n        pass  # x\r\n')
         self.assertEqual(client.Symbols(), ExpectedSymbols(client.Text()))
 
+    def testLoneCarriageReturnIsACharacterOfItsLine(self):
+        client = CClient()
+        client.Open('x = 1\ry = 2\ndef f():\r\n    pass\r')
+        client.Change([Change(0, 8, 0, 8, 'Z'), Change(2, 8, 2, 8, '#')])
+        self.assertEqual(client.Text(), 'x = 1\ry Z= 2\ndef f():\r\n    pass#\r')
+        self.assertEqual(client.Symbols()[0]['range']['end'], {'line': 2, 'character': 10})
+
 
 @unittest.skipIf(kSkipReason, kSkipReason)
 class BadInputTest(unittest.TestCase):

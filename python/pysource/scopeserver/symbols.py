@@ -97,7 +97,7 @@ class COutlineJson(object):
         self._prefixes = []     # per symbol: what closes the symbols before it
         self._in_class = []     # per symbol: whether its parent is a class
         self._pieces = []
-        self._by_line = None    # line -> symbols whose piece reads it (made when needed)
+        self._by_end = None     # (end lines sorted, their symbols), made when needed
         self._tail = ''
         self._fresh = False     # no edit since the pieces were made
         self.stats = dict(built=0, aligned=0, rewritten=0)
@@ -136,21 +136,22 @@ class COutlineJson(object):
     def _Rewrite(self, doc, outline, count):
         """The outline and the line count are as built: only the symbols
         that read an edited line are written again."""
-        if self._by_line is None:
-            self._by_line = by_line = {}
-            for i, (name, kind, header, end) in enumerate(outline):
-                for line in range(header, header + self._templates[i][1] + 1):
-                    by_line.setdefault(line, []).append(i)
-                if end > header + self._templates[i][1]:
-                    by_line.setdefault(end, []).append(i)
+        if self._by_end is None:
+            order = sorted(range(len(outline)), key=lambda i: outline[i][3])
+            self._by_end = [outline[i][3] for i in order], order
+        first, last = self._same_top + 1, count - self._same_bottom
+        templates = self._templates
         redo = set()
-        for line in range(self._same_top + 1, count - self._same_bottom + 1):
-            redo.update(self._by_line.get(line, ()))
+        # Symbols that read an edited line: in their header through their name, or at their end.
+        for i in range(bisect.bisect_left(self._headers, first - kNameSearchLines),
+                       bisect.bisect_right(self._headers, last)):
+            header = outline[i][2]
+            if header + templates[i][1] >= first:
+                redo.add(i)
+        ends, order = self._by_end
+        redo.update(order[bisect.bisect_left(ends, first):bisect.bisect_right(ends, last)])
         for i in redo:
-            old_span = self._templates[i][1]
             self._templates[i] = self._Template(doc, outline[i], count, self._in_class[i])
-            if self._templates[i][1] != old_span:
-                self._by_line = None
             self._pieces[i] = self._prefixes[i] + _Fill(self._templates[i], outline[i])
         self.stats['rewritten'] += len(redo)
 
@@ -244,7 +245,7 @@ class COutlineJson(object):
         self._headers = [entry[2] for entry in outline]
         self._templates, self._prefixes = new_templates, new_prefixes
         self._in_class, self._pieces = new_in_class, new_pieces
-        self._by_line = None
+        self._by_end = None
         self.stats['aligned'] += 1
         self.stats['rewritten'] += made
 
@@ -267,7 +268,7 @@ class COutlineJson(object):
         self._prefixes = prefixes = []
         self._in_class = in_classes = []
         self._pieces = pieces = []
-        self._by_line = None
+        self._by_end = None
         kinds = {}
         stack = []
         for i, entry in enumerate(outline):
