@@ -469,6 +469,25 @@ class PipesTest(unittest.TestCase):
         server.stdout.close()
         server.stderr.close()
 
+    def testAClientThatStopsReadingEndsTheServer(self):
+        server = self.Start()
+        server.stdout.close()
+        try:
+            server.stdin.write(self.Message('initialize', {'capabilities': {}}, 1) +
+                               self.Message('textDocument/didOpen', {'textDocument': {
+                                   'uri': 'file:///p.py', 'languageId': 'python', 'version': 1,
+                                   'text': kSample}}) +
+                               self.Message('textDocument/documentSymbol', {'textDocument': {'uri': 'file:///p.py'}}, 2))
+            server.stdin.close()
+        except (IOError, OSError):
+            pass  # it is gone already
+        self.assertEqual(server.wait(), 1)
+        err = server.stderr.read()
+        server.stderr.close()
+        self.assertIn(b'the client went away', err)
+        self.assertNotIn(b'Traceback', err)
+        self.assertNotIn(b'Exception ignored', err)
+
 
 if __name__ == '__main__':
     unittest.main()

@@ -3,6 +3,7 @@
 Speaks the Language Server Protocol on stdin and stdout."""
 
 import argparse
+import os
 import sys
 
 from .document import DocumentClass
@@ -25,7 +26,13 @@ def Main(argv=None):
     stdout = getattr(sys.stdout, 'buffer', sys.stdout)
     # Anything printed by mistake goes to the log, never into the protocol's stream.
     sys.stdout = log
-    return Serve(stdin_fd, stdout, document_class=document_class, log=log, verbose=args.verbose)
+    code = Serve(stdin_fd, stdout, document_class=document_class, log=log, verbose=args.verbose)
+    # Whatever is still buffered for a client that went away goes nowhere at exit.
+    try:
+        os.dup2(os.open(os.devnull, os.O_WRONLY), stdout.fileno())
+    except (OSError, AttributeError, ValueError):
+        pass
+    return code
 
 
 if __name__ == '__main__':
