@@ -324,7 +324,8 @@ def Main():
         ours.Close()
         print('  scope server: round trip %s, server CPU %.2f ms, first answer %.0f ms' % (
             Ms(times), cpu * 1e3, first * 1e3))
-        print('    answer: %d bytes, %d top-level symbols; the client decodes it in %.1f ms (not in the round trip)' % size)
+        print('    answer: %d bytes, %d top-level symbols; the client decodes it in %.1f ms '
+              '(not in the round trip)' % size)
         parts, doc = Parts(text, place, min(args.samples, 100))
         held, symbols = Held(text, place)
         for name in ('edit', 'outline', 'json', 'response'):

@@ -3,7 +3,6 @@ answers held against a fresh document of the same text, positions in every
 encoding, bad input, and the server run as a command over pipes."""
 
 import json
-import os
 import random
 import subprocess
 import sys
@@ -477,7 +476,8 @@ class PipesTest(unittest.TestCase):
                                self.Message('textDocument/didOpen', {'textDocument': {
                                    'uri': 'file:///p.py', 'languageId': 'python', 'version': 1,
                                    'text': kSample}}) +
-                               self.Message('textDocument/documentSymbol', {'textDocument': {'uri': 'file:///p.py'}}, 2))
+                               self.Message('textDocument/documentSymbol',
+                                            {'textDocument': {'uri': 'file:///p.py'}}, 2))
             server.stdin.close()
         except (IOError, OSError):
             pass  # it is gone already
