@@ -8,7 +8,7 @@ import pickle
 import sys
 import unittest
 
-from support import PY3, Picklers, RunPython
+from support import PY3, CapturedStderr, Picklers, RunPython
 from docsupport import (CEditResult, CScopeDocument, ErrorFields, Fields, Fresh, Outline, Place,
                         kSample)
 
@@ -138,6 +138,27 @@ class EditResultTest(DocumentTestCase):
         self.assertIn(('pass',), set(l.fTokens for l in r.fRemoved))
         self.assertMatchesFresh(doc, text)
         self.assertEqual(doc.GetLastEditStats()['edits'], 3)
+
+    def testEditsFarApartAreReadEachWhereItIs(self):
+        text = ''.join('v%d = %d\n' % (k, k) for k in range(400))
+        doc = CScopeDocument(text)
+        keep = doc.GetLogicals()
+        # Bottom first, as an editor sends the edits of several cursors.
+        r = doc.EditMany([(300, 0, 300, 4, 'w300'), (2, 0, 2, 0, 'def f():\n    pass\n')])
+        self.assertLessEqual(doc.GetLastEditStats()['rows_scanned'], 4)
+        self.assertEqual([(l.fTokens[0], l.fLineno) for l in r.fAdded], [('def', 2), ('pass', 3), ('w300', 302)])
+        # A removed logical carries its number as the edits above it left it.
+        self.assertEqual([(l.fTokens[0], l.fLineno) for l in r.fRemoved], [('v299', 302)])
+        self.assertEqual(r.fRegion, (2, 299, 301))
+        self.assertEqual(sum(1 for a, b in zip(keep[1:], doc.GetLogicals()[3:]) if a is b), 398)
+        self.assertMatchesFresh(doc)
+
+    def testEditsThatMeetAreReadTogether(self):
+        doc = CScopeDocument(kSample)
+        # The first opens a bracket the second closes lines below.
+        r = doc.EditMany([(1, 9, 1, 9, ' (1,'), (3, 0, 3, 0, ')\n')])
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertMatchesFresh(doc)
 
     def testEmptyBatchAndSameText(self):
         doc = CScopeDocument(kSample)
@@ -299,6 +320,43 @@ class ReadAgainOnlyWhatChangedTest(DocumentTestCase):
         self.assertMatchesFresh(self.doc)
 
 
+class IndentationBelowTheEditTest(DocumentTestCase):
+
+    def testADedentBelowIsCheckedAgainstTheNewStack(self):
+        text = 'if a:\n  if b:\n    x\n  y\n'
+        doc = CScopeDocument(text)
+        r = doc.Edit(2, 0, 2, 0, ' ')
+        self.assertEqual(r.fRegion, (2, 1, 1))
+        self.assertEqual((r.fError.msg, r.fError.lineno, r.fError.offset, r.fError.text),
+                         ('unindent does not match any outer indentation level', 4, 2, '  y\n'))
+        doc.SelfCheck()
+        r = doc.Edit(4, 0, 4, 0, ' ')
+        self.assertTrue(r.fReadable)
+        self.assertMatchesFresh(doc, 'if a:\n   if b:\n    x\n   y\n')
+
+    def testTheLinesKeptWhileTheTextDoesNotReadAreTheLastReadables(self):
+        doc = CScopeDocument(kSample)
+        doc.EditMany([(16, 7, 16, 7, '['), (3, 0, 3, 0, '  ')])
+        self.assertFalse(doc.IsReadable())
+        doc.SelfCheck()   # the rows outside the edits against the last text that read
+        doc.Edit(10, 0, 12, 0, '')
+        doc.SelfCheck()
+        r = doc.EditMany([(14, 7, 14, 8, ''), (3, 0, 3, 2, '')])
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertEqual([l.fTokens[:2] for l in r.fRemoved if l.fKind == 2], [('def', 'f'), ('def', 'inner')])
+        self.assertMatchesFresh(doc)
+
+    def testTheEmptyLastLineRunsNoCheck(self):
+        # The last line taken out leaves its row empty: what it held before
+        # must not be checked under a deeper block put in above.
+        doc = CScopeDocument('x = 1\n    y\n')
+        doc.Edit(2, 0, 3, 0, '')
+        doc.SelfCheck()
+        r = doc.Edit(1, 0, 1, 0, 'if a:\n        ')
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertMatchesFresh(doc, 'if a:\n        x = 1\n')
+
+
 class HandEditedLogicalsTest(unittest.TestCase):
 
     def testALineNumberChangedFromOutsideIsRefusedAndDetected(self):
@@ -315,6 +373,15 @@ class HandEditedLogicalsTest(unittest.TestCase):
         with self.assertRaises(AssertionError) as caught:
             doc.SelfCheck()
         self.assertIn('elsewhere', str(caught.exception))
+
+
+    def testANameTheFinderRefusesLeavesTheWholeFileNamedAgain(self):
+        doc = CScopeDocument(kSample)
+        doc.GetLogicals()[5].fLocalScopeName = 5
+        with CapturedStderr():
+            self.assertRaises(TypeError, doc.Edit, 7, 16, 7, 16, 'y')
+        self.assertEqual(doc.GetLogicals()[5].fLocalScopeName, 'f#0')
+        doc.SelfCheck()
 
 
 class CheckEveryEditTest(unittest.TestCase):
@@ -348,8 +415,11 @@ class LeakTest(unittest.TestCase):
             doc.Edit(7, 16, 7, 18, '')
             doc.Edit(1, 0, 1, 0, '(')
             doc.Edit(1, 0, 1, 1, '')
+            doc.EditMany([(20, 0, 20, 0, piece + '\n'), (1, 0, 1, 0, piece)])
+            doc.EditMany([(1, 0, 1, 2, ''), (20, 0, 21, 0, '')])
             doc.GetOutline()
             doc.GetBodyOfScope('A#0')
+            doc.SelfCheck()
             try:
                 doc.Edit(99, 0, 99, 0, piece)
             except ValueError:

@@ -93,6 +93,33 @@ class ParityTest(unittest.TestCase):
             self.assertEqual(Outcome(source, False), Outcome(source, True), repr(source))
 
 
+class ExhaustiveTest(unittest.TestCase):
+    """Every character, and every pair of the characters the rules name, in
+    the places where they decide a token."""
+
+    kSignificant = (" \t\f\r\n'\"\\#()[]{}.0123456789eEjJlLxXoObBuUrR<>=!*/%&|^~`@:;,$?_a-+" +
+                    ('\x00\x0b' if kPy2 else u'\x00\x0b\xe9\u20ac\U0001d11e'))
+
+    def Check(self, sources):
+        for source in sources:
+            self.assertEqual(Outcome(source, False), Outcome(source, True), repr(source))
+
+    def testEveryCharacter(self):
+        chars = [chr(c) for c in range(256)]
+        if not kPy2:
+            chars += [u'\u2028', u'\u3000', u'\ufeff', u'\U0001d11e', u'\udcff']
+        for c in chars:
+            self.Check([c, c + '\n', 'x' + c + 'y\n', "'" + c + "'\n", '#' + c + '\n', ' ' + c + ' \\\n',
+                        '(' + c + '\n)', '"""' + c + '\n"""\n', '1' + c + '2\n'])
+
+    def testEveryPair(self):
+        chars = self.kSignificant
+        for a in chars:
+            for b in chars:
+                pair = a + b
+                self.Check([pair, pair + '\n', 'x = ' + pair + '\n', ' ' + pair + ' 1\n'])
+
+
 class ErrorTest(unittest.TestCase):
 
     def Raised(self, source, filename='f.py'):
@@ -200,6 +227,48 @@ class RecordTest(unittest.TestCase):
         self.assertIs(got[0].fTokens[0], got[0].fTokens[4])
 
 
+    def testRecordTypeThatFails(self):
+        made = []
+
+        def Make(*args):
+            if len(made) == 2:
+                raise KeyError('third')
+            made.append(args)
+            return args
+        # Its error wins over the scan's, which comes after the records.
+        for source in ['a\nb\nc\nd\n', 'a\nb\nc\nd = (\n']:
+            del made[:]
+            with self.assertRaises(KeyError):
+                _reader.Read(source, 'f', Make)
+            self.assertEqual(len(made), 2)
+        del made[:]
+        self.assertRaises(SyntaxError, _reader.Read, 'a\n(', 'f', Make)
+
+    def testRecordTypeIsLookedUpAtEachRead(self):
+        import pysource._fastaccess as fastaccess
+
+        class Sub(LogicalLineType):
+            pass
+        fastaccess.LogicalLineType = Sub
+        try:
+            native, ref = logicals.ReadLogicals('x\n'), logicals.ReadLogicals('x\n', reference=True)
+        finally:
+            fastaccess.LogicalLineType = LogicalLineType
+        self.assertEqual((type(native[0]), type(ref[0])), (Sub, Sub))
+
+    def testCollectorStateKeptAcrossLongReads(self):
+        source = 'x = [1,\n 2]\n' * 5000
+        enabled = gc.isenabled()
+        try:
+            for state in (True, False):
+                (gc.enable if state else gc.disable)()
+                logicals.ReadLogicals(source)
+                self.assertRaises(SyntaxError, logicals.ReadLogicals, source + '(')
+                self.assertEqual(gc.isenabled(), state)
+        finally:
+            (gc.enable if enabled else gc.disable)()
+
+
 class ResumeTest(unittest.TestCase):
 
     def testRowStates(self):
@@ -210,11 +279,79 @@ class ResumeTest(unittest.TestCase):
             (0, 0, 0, 0, 0, 2), (1, 1, 0, 1, 0, -1), (0, 1, 0, 1, 0, 0), (0, 1, 1, 1, 0, -1),
             (0, 1, 0, 0, -1, -1)])
 
+    def testStateAfterTheText(self):
+        # (string, needcont, cont, open, depth) after the last row.
+        for source, want in [
+                ("s = '''a\n", (3, 0, 0, 1, 0)), ('s = """\n', (4, 0, 0, 1, 0)),
+                ("s = 'a\\\n", (1, 1, 0, 1, 0)), ('s = "a\\\r\n', (2, 1, 0, 1, 0)),
+                ("'a\\\n", (1, 1, 0, 0, 0)),
+                ("s = 'a\\\nb\n", (0, 1, 0, 1, 0)), ("s = 'a\\\nb'\n", (0, 0, 0, 0, 0)),
+                ("s = 'a\\\nb\nx\n", (0, 1, 0, 0, 0)),
+                ('x = \\\n', (0, 0, 1, 1, 0)), ('\\\n', (0, 0, 1, 0, 0)), ('f(\n', (0, 0, 0, 1, 1)),
+                ('f(]\n', (0, 0, 0, 0, 0)), (')\n', (0, 0, 0, 0, -1)), (')((\n', (0, 0, 0, 1, 1)),
+                ('x # (\n', (0, 0, 0, 0, 0)),
+                # An unterminated string is error tokens: the bracket counts.
+                ("x = '(\n", (0, 0, 0, 1, 1))]:
+            self.assertEqual(_reader.RowStates(source)[-1][:5], want, repr(source))
+
+    def testIndentationColumns(self):
+        # Only rows that start clean and hold code run the check.
+        source = "if 1:\n\t x\n  # c\n\n  \fy = (\n  z)\n\\\n w\ns = '''\n  '''\n"
+        columns = [row[5] for row in _reader.RowStates(source)]
+        self.assertEqual(columns, [0, 9, -1, -1, 0, -1, 0, -1, 0, -1, -1])
+
+    def testScanCounts(self):
+        self.assertEqual(_reader.Scan('x = 1\n\ny(\n)'), (4, 6, 3, True))
+        self.assertEqual(_reader.Scan(''), (0, 0, 0, True))
+        self.assertEqual(_reader.Scan('(\n'), (1, 1, 0, False))
+
+    def testLargeTexts(self):
+        deep = '(' * 100000 + '\n' + ')' * 100000 + '\n'
+        self.assertEqual(len(logicals.ReadLogicals(deep)), 1)
+        self.assertEqual(Outcome(deep[:-100], False), Outcome(deep[:-100], True))
+        long_line = 'x = ' + ' + '.join(['a'] * 100000) + '\n'
+        self.assertEqual(len(logicals.ReadLogicals(long_line)[0].fTokens), 200001)
+        many = 'pass\n' * 200000
+        self.assertEqual(logicals.ReadLogicals(many)[-1].fLineno, 200000)
+
     def testResumedScansReadAsTheWholeScan(self):
         sources = kStateTexts + [s for s, _ in corners.kLayout + corners.kNewlinesAndStrings]
         sources += list(reader_adversarial.Texts(7, 500))
         checked = sum(_reader.CheckResume(source) for source in sources)
         self.assertGreater(checked, 1000)
+
+
+class ToolTest(unittest.TestCase):
+
+    def testGeneratedTextsAreSeededAndReachEveryOutcome(self):
+        texts = list(reader_adversarial.Texts(3, 400))
+        self.assertEqual(texts, list(reader_adversarial.Texts(3, 400)))
+        outcomes = set()
+        for text in texts:
+            got = reader_adversarial.Outcome(text, False)
+            outcomes.add(got[1] + ': ' + got[2][0] if got[0] == 'error' else 'reads')
+        self.assertEqual(outcomes, set(['reads', 'SyntaxError: EOF in multi-line string',
+                                        'SyntaxError: EOF in multi-line statement',
+                                        'IndentationError: unindent does not match any outer indentation level']))
+
+    def testParityOverATree(self):
+        import reader_parity
+        tmp = tempfile.mkdtemp()
+        try:
+            for name, data in [('a.py', b'def f():\r\n  return 1\r'), ('b.py', b'x = (\n'),
+                               ('c.py', b'if 1:\n  x\n y\n')]:
+                with open(os.path.join(tmp, name), 'wb') as f:
+                    f.write(data)
+            saved, sys.stdout = sys.stdout, support.TextBuffer()
+            try:
+                status = reader_parity.NativeParity([tmp], 3)
+                printed = sys.stdout.getvalue()
+            finally:
+                sys.stdout = saved
+        finally:
+            shutil.rmtree(tmp)
+        self.assertEqual(status, 0)
+        self.assertIn('files 3, identical 3 (records 2, rejected alike 2), differing 0', printed)
 
 
 class ReferenceTest(unittest.TestCase):

@@ -116,10 +116,72 @@ def _Line(rng, tame, used, depth):
     return out
 
 
+# Ordinary code that edits are made into.
+kCode = r'''# -*- coding: utf-8 -*-
+"""Module doc
+over lines."""
+import os, sys
+from foo import (bar,
+                 baz)  # trailing
+
+
+class Widget(object):
+    kLimit = 0777L
+
+    def __init__(self, name, *items, **kw):
+        self.name = name
+        self.items = [i for i in items
+                      if i is not None]
+        s = 'a\
+b'
+        t = ur'x' "y" b"z"
+        if a <> b and `c`:
+            print >>sys.stderr, "bad %s" % (name,)
+    	pass
+
+    @property
+    def size(self):
+        return len(self.items) + \
+            0x1fL
+
+
+async def run():
+    await x
+# dedented comment
+    return {1: 2,
+            3: 4}
+def tail(): return """t
+    '' "" \""" + r'\''
+'''
+
+
+def _Edited(rng):
+    """A window of ordinary code with a few edits made in it."""
+    lines = kCode.split('\n')
+    start = rng.randint(0, len(lines) - 1)
+    text = '\n'.join(lines[start:start + rng.randint(1, 15)])
+    if rng.random() < 0.3:
+        text = text.replace('\n', rng.choice(['\r\n', '\r']))
+    for _ in range(rng.randint(1, 3)):
+        at = rng.randint(0, len(text))
+        roll = rng.random()
+        if roll < 0.3:
+            text = text[:at] + text[at + rng.randint(1, 6):]
+        elif roll < 0.6:
+            text = text[:at] + rng.choice(['"""', "'''", "'", '"', '\\', '\\\n', '\\\r\n', '(', ')', ']',
+                                           '\t', '\f', ' ', '\r', '\n', '#', 'u', 'r']) + text[at:]
+        else:
+            text = text[:at] + _Piece(rng, False, [0]) + text[at:]
+    return text + rng.choice(['\n', '\n', '', '  ', '\r\n'])
+
+
 def Text(rng):
-    """One generated text: tame ones (strings closed, brackets mostly in
+    """One generated text: a window of ordinary code with edits in it, or
+    pieces put together: tame ones (strings closed, brackets mostly in
     order, indentation from a stack) read more often, so that what follows
     the pieces is read too; wild ones rarely read."""
+    if rng.random() < 0.25:
+        return _Edited(rng)
     tame = rng.random() < 0.7
     used = ['']
     depth = [0]

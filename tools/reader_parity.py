@@ -256,6 +256,8 @@ def Main(argv):
                         help='native against reference on COUNT generated texts')
     parser.add_argument('--seed', type=int, default=1, help='seed of the generated texts')
     args, extra_roots = parser.parse_known_args(argv)
+    if any(r.startswith('-') for r in extra_roots):
+        parser.error('unrecognized arguments: %s' % ' '.join(extra_roots))
     if args.worker:
         Work(args.worker)
         return 0

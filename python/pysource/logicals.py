@@ -11,6 +11,12 @@ reads backticks, `<>`, `0777L` and the like otherwise than 2.7, and not alike
 on every 3.x version. Tokens are byte strings on 2.7 and str on 3.x.
 tools/reader_parity.py compares the two over a source tree.
 
+ReadLogicals reads with the native reader (pysource._reader, built from
+src/pysource/reader/) by default. The code here is the reference it
+follows rule for rule: ReadLogicals(..., reference=True) or ReadReference
+runs it, and tools/reader_parity.py --native holds the two against each
+other.
+
 What still differs on 3.x, for the same file or the same bytes:
 
 - Bytes are decoded as the source declares: a UTF-8 BOM, else a coding line

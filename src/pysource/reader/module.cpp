@@ -61,17 +61,12 @@ compat::TextChars textOf(PyObject* text) {
 template <class Body>
 PyObject* withChars(const compat::TextChars& chars, Body&& body) {
     const size_t n = static_cast<size_t>(chars.length);
-    switch (chars.kind) {
-#if PY_MAJOR_VERSION >= 3
-    // 2.7 reads bytes only; the wider kinds' builders exist on 3.x only.
-    case 2:
-        return body(static_cast<const uint16_t*>(chars.data), n, false);
-    case 4:
-        return body(static_cast<const uint32_t*>(chars.data), n, false);
-#endif
-    default:
-        return body(static_cast<const uint8_t*>(chars.data), n, chars.ascii);
+    // 2.7's text is bytes: the wider kinds are not even made there.
+    if constexpr (compat::kPython3) {
+        if (chars.kind == 2) return body(static_cast<const uint16_t*>(chars.data), n, false);
+        if (chars.kind == 4) return body(static_cast<const uint32_t*>(chars.data), n, false);
     }
+    return body(static_cast<const uint8_t*>(chars.data), n, chars.ascii);
 }
 
 PyObject* Read(PyObject*, PyObject* args) {

@@ -103,16 +103,16 @@ void doc_dealloc(PyObject* self) {
 PyObject* m_Edit(PyObject* self, PyObject* args, PyObject* kwargs) {
     return py::guarded([&]() -> PyObject* {
         static const char* kwlist[] = {"start_line", "start_col", "end_line", "end_col", "text", "utf16", nullptr};
-        EditSpec spec;
+        EditRequest request;
         PyObject* utf16 = nullptr;
-        if (!PyArg_ParseTupleAndKeywords(args, kwargs, "OOOOO|O:Edit", const_cast<char**>(kwlist), &spec.startLine,
-                                         &spec.startColumn, &spec.endLine, &spec.endColumn, &spec.text, &utf16)) {
+        if (!PyArg_ParseTupleAndKeywords(args, kwargs, "OOOOO|O:Edit", const_cast<char**>(kwlist), &request.startLine,
+                                         &request.startColumn, &request.endLine, &request.endColumn, &request.text, &utf16)) {
             py::fail();
         }
         Document& d = ready(self);
         const bool units = flagArgument(utf16, "utf16");
-        requireEditText(spec.text);
-        return applyEdits(d, {spec}, units).release();
+        requireEditText(request.text);
+        return applyEdits(d, {request}, units).release();
     });
 }
 
@@ -132,7 +132,7 @@ PyObject* m_EditMany(PyObject* self, PyObject* args, PyObject* kwargs) {
         py::Ref seq = py::check(PySequence_Fast(edits, "edits must be a sequence of edits"));
         const Py_ssize_t n = PySequence_Fast_GET_SIZE(seq.get());
         std::vector<py::Ref> held;
-        std::vector<EditSpec> specs;
+        std::vector<EditRequest> requests;
         for (Py_ssize_t i = 0; i < n; ++i) {
             PyObject* item = PySequence_Fast_GET_ITEM(seq.get(), i);
             if (!(PyTuple_Check(item) || PyList_Check(item)) || PySequence_Fast_GET_SIZE(item) != 5) {
@@ -151,10 +151,10 @@ PyObject* m_EditMany(PyObject* self, PyObject* args, PyObject* kwargs) {
                     py::fail();
                 }
             }
-            specs.push_back({f[0], f[1], f[2], f[3], f[4]});
+            requests.push_back({f[0], f[1], f[2], f[3], f[4]});
             held.push_back(std::move(tuple));
         }
-        return applyEdits(d, specs, units).release();
+        return applyEdits(d, requests, units).release();
     });
 }
 
@@ -248,9 +248,11 @@ PyObject* m_GetLastEditStats(PyObject* self, PyObject*) {
 PyObject* m_MemoryUse(PyObject* self, PyObject*) {
     return py::guarded([&]() -> PyObject* {
         Document& d = ready(self);
+        size_t damage = 0;
+        for (const DamageRange& r : d.damage.ranges) damage += r.baselineMiddle.capacity() * sizeof(uint32_t);
         return Py_BuildValue("{s:n,s:n,s:n}", "text", static_cast<Py_ssize_t>(d.text.bytesHeld()), "rows",
                              static_cast<Py_ssize_t>(d.rows.bytesHeld()), "damage",
-                             static_cast<Py_ssize_t>(d.damage.baselineMiddle.capacity() * sizeof(uint32_t)));
+                             static_cast<Py_ssize_t>(damage));
     });
 }
 

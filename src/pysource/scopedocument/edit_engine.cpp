@@ -3,27 +3,25 @@
 //
 // A batch of edits is applied to the text in order; every edit is checked
 // against the text the ones before it left, and a bad one undoes them all.
-// The span the batch touched (with what the baseline held there) is the
-// damage. The text is then read: when it reads, the logicals that differ
-// from the list's replace them (the same objects stay for the rest, with
-// their line numbers shifted), FindChanges names them and the cache forgets
-// the changed scopes; when it does not, the list stays as the baseline and
-// the damage stays for the next edit.
+// The ranges the batch touched (with what the baseline held there) join the
+// damage. The damage is then read again (reread.cpp): when the text reads,
+// the logicals that differ from the list's replace them (the same objects
+// stay for the rest, with their line numbers shifted), FindChanges names
+// them and the cache forgets the changed scopes; when it does not, the list
+// stays as the baseline and the damage stays for the next edit.
 //
-// Python code runs here only in the reader, the finder and the cache (all
-// of them the project's own, on the document's private list) and in the
-// destructors of the logicals dropped; `busy` refuses a call that comes
-// back into the document meanwhile.
+// Python code runs here only in the finder and the cache (the project's own,
+// on the document's private list), in the self-check and in the destructors
+// of the logicals dropped; `busy` refuses a call that comes back into the
+// document meanwhile.
 #include "common/messages.hpp"
 #include "common/pycompat.hpp"
-#include "pysource/contracts/logical_record.hpp"
 #include "pysource/scopedocument/document.hpp"
 
 #include <algorithm>
 
 namespace sdoc {
 
-using contracts::LogicalLineObject;
 
 bool gCheckEveryEdit = false;
 
@@ -72,37 +70,48 @@ void replaceText(Document& d, size_t start, size_t end, const void* data, int wi
 bool endsWithNewline(const TextStore& t) { return t.size() > 0 && t.at(t.size() - 1) == '\n'; }
 
 // Widens the damage to cover characters [start, end) of the text as it
-// stands before an edit that puts `n` characters there.
+// stands before an edit that puts `n` characters there: the ranges it
+// meets or touches become one.
 void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlinesRemoved, size_t newlinesAdded,
                   const DroppedRows& dropped) {
     Damage& g = d.damage;
-    if (!g.active) {
-        g.active = true;
-        g.start = start;
-        g.end = end;
-        g.baselineMiddle.clear();
-        d.text.copyOut(start, end, g.baselineMiddle);
-        g.lineDelta = 0;
+    if (!g.active()) {
         g.baselineRows = d.rows.count();
         g.baselineEndsWithNewline = endsWithNewline(d.text);
-    } else {
-        if (start < g.start) {
-            std::vector<uint32_t> head;
-            d.text.copyOut(start, g.start, head);
-            g.baselineMiddle.insert(g.baselineMiddle.begin(), head.begin(), head.end());
-            g.start = start;
-        }
-        if (end > g.end) {
-            d.text.copyOut(g.end, end, g.baselineMiddle);
-            g.end = end;
-        }
     }
-    g.end = g.end + n - (end - start);
-    g.rowsDropped += dropped.columns.size();
+    std::vector<DamageRange>& ranges = g.ranges;
+    size_t lo = 0;
+    while (lo < ranges.size() && ranges[lo].end < start) ++lo;
+    size_t hi = lo;
+    while (hi < ranges.size() && ranges[hi].start <= end) ++hi;
+    DamageRange merged;
+    merged.start = lo < hi ? std::min(start, ranges[lo].start) : start;
+    const size_t mergedEnd = lo < hi ? std::max(end, ranges[hi - 1].end) : end;
+    size_t at = merged.start;
+    for (size_t k = lo; k < hi; ++k) {
+        // Between ranges the text is the baseline's.
+        d.text.copyOut(at, ranges[k].start, merged.baselineMiddle);
+        merged.baselineMiddle.insert(merged.baselineMiddle.end(), ranges[k].baselineMiddle.begin(),
+                                     ranges[k].baselineMiddle.end());
+        merged.lineDelta += ranges[k].lineDelta;
+        merged.droppedMinColumn = std::min(merged.droppedMinColumn, ranges[k].droppedMinColumn);
+        merged.rowsDropped += ranges[k].rowsDropped;
+        at = ranges[k].end;
+    }
+    d.text.copyOut(at, mergedEnd, merged.baselineMiddle);
+    const long shift = static_cast<long>(n) - static_cast<long>(end - start);
+    merged.end = static_cast<size_t>(static_cast<long>(mergedEnd) + shift);
+    merged.lineDelta += static_cast<long>(newlinesAdded) - static_cast<long>(newlinesRemoved);
+    merged.rowsDropped += dropped.columns.size();
     for (int16_t c : dropped.columns) {
-        if (c >= 0) g.droppedMinColumn = std::min<int64_t>(g.droppedMinColumn, c);
+        if (c >= 0) merged.droppedMinColumn = std::min<int64_t>(merged.droppedMinColumn, c);
     }
-    g.lineDelta += static_cast<long>(newlinesAdded) - static_cast<long>(newlinesRemoved);
+    for (size_t k = hi; k < ranges.size(); ++k) {
+        ranges[k].start = static_cast<size_t>(static_cast<long>(ranges[k].start) + shift);
+        ranges[k].end = static_cast<size_t>(static_cast<long>(ranges[k].end) + shift);
+    }
+    ranges.erase(ranges.begin() + static_cast<std::ptrdiff_t>(lo), ranges.begin() + static_cast<std::ptrdiff_t>(hi));
+    ranges.insert(ranges.begin() + static_cast<std::ptrdiff_t>(lo), std::move(merged));
 }
 
 struct Undo {
@@ -123,14 +132,14 @@ void undoAll(Document& d, std::vector<Undo>& undo, const Damage& saved) {
 
 // Applies the batch to the text, keeping in `undo` what puts it back; on a
 // bad edit restores text, rows and damage and rethrows.
-void applyToText(Document& d, const std::vector<EditSpec>& specs, bool utf16, std::vector<Undo>& undo) {
+void applyToText(Document& d, const std::vector<EditRequest>& requests, bool utf16, std::vector<Undo>& undo) {
     const Damage saved = d.damage;
     try {
-        for (const EditSpec& spec : specs) {
-            const size_t start = offsetOf(d, spec.startLine, spec.startColumn, utf16, "start");
-            const size_t end = offsetOf(d, spec.endLine, spec.endColumn, utf16, "end");
+        for (const EditRequest& request : requests) {
+            const size_t start = offsetOf(d, request.startLine, request.startColumn, utf16, "start");
+            const size_t end = offsetOf(d, request.endLine, request.endColumn, utf16, "end");
             if (end < start) msg::raise(PyExc_ValueError, "the range ends before it starts");
-            const compat::CharsView chars = compat::strChars(spec.text);
+            const compat::CharsView chars = compat::strChars(request.text);
             const size_t n = static_cast<size_t>(chars.length);
             size_t added = 0;
             for (size_t i = 0; i < n; ++i) added += charOf(chars.data, chars.width, i) == '\n';
@@ -212,10 +221,11 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
         d.readable = true;
     } else {
         // The baseline is the empty text.
-        d.damage.active = true;
-        d.damage.start = 0;
-        d.damage.end = d.text.size();
-        d.damage.lineDelta = static_cast<long>(d.rows.count()) - 1;
+        DamageRange all;
+        all.start = 0;
+        all.end = d.text.size();
+        all.lineDelta = static_cast<long>(d.rows.count()) - 1;
+        d.damage.ranges.push_back(std::move(all));
         d.damage.baselineRows = 1;
         d.damage.baselineEndsWithNewline = false;
     }
@@ -227,15 +237,15 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
     d.cache = py::check(PyObject_CallFunctionObjArgs(gImports.bodyCache, d.list.get(), nullptr));
 }
 
-py::Ref applyEdits(Document& d, const std::vector<EditSpec>& specs, bool utf16) {
+py::Ref applyEdits(Document& d, const std::vector<EditRequest>& requests, bool utf16) {
     BusyGuard busy(d);
     const EditStats before = d.stats;
     d.stats = EditStats();
-    d.stats.edits = specs.size();
+    d.stats.edits = requests.size();
     const Damage saved = d.damage;
     std::vector<Undo> undo;
     try {
-        applyToText(d, specs, utf16, undo);
+        applyToText(d, requests, utf16, undo);
     } catch (...) {
         d.stats = before;
         throw;
@@ -287,9 +297,9 @@ py::Ref setText(Document& d, PyObject* source) {
     py::Ref sc = py::check(compat::intFromSsize(head - d.rows.start(startRow, old)));
     py::Ref el = py::check(compat::intFromSsize(endRow + 1));
     py::Ref ec = py::check(compat::intFromSsize(old - tail - d.rows.start(endRow, old)));
-    std::vector<EditSpec> specs{{sl.get(), sc.get(), el.get(), ec.get(), middle.get()}};
-    if (head == old && head == n) specs.clear();
-    return applyEdits(d, specs, false);
+    std::vector<EditRequest> requests{{sl.get(), sc.get(), el.get(), ec.get(), middle.get()}};
+    if (head == old && head == n) requests.clear();
+    return applyEdits(d, requests, false);
 }
 
 }  // namespace sdoc
