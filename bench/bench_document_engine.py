@@ -76,6 +76,20 @@ def Paste(doc, text):
     return Cycle(doc, places, lambda d, l, c: d.Edit(l, 0, l, 0, chunk), lambda d, l, c: d.Edit(l, 0, l + 20, 0, ''))
 
 
+def Cursors(doc, text, count=10):
+    """A character typed at `count` places spread over the file in one call
+    (bottom first, as an editor sends several cursors' edits), then taken out."""
+    places = sorted(BodyPlaces(text, 'result += ', count), reverse=True)
+    typed = [(l, c, l, c, 'x') for l, c in places]
+    erased = [(l, c, l, c + 1, '') for l, c in places]
+
+    def Run(calls):
+        for _ in range(calls // 2):
+            doc.EditMany(typed)
+            doc.EditMany(erased)
+    return Run
+
+
 def Measure(label, run, calls, batches=15):
     samples = [s * 1e6 for s in TimeBatches(run, batches, calls)]
     print('  %-36s %s' % (label, FormatSpread(samples, ' us')))
@@ -100,6 +114,7 @@ def Main(argv):
         Measure('Enter, and Backspace joining lines', EnterBackspace(doc, text), 40 if lines > 20000 else 200)
         Measure('a def line typed in, and taken out', DefLine(doc, text), 40 if lines > 20000 else 200)
         Measure('a 20-line paste, and taken out', Paste(doc, text), 20 if lines > 20000 else 100)
+        Measure('10 cursors typing (EditMany), per call', Cursors(doc, text), 40)
         if lines >= 10000:
             opened, closed = [], []
             for _ in range(5):

@@ -3,11 +3,12 @@ not read and back, the body cache, pickling and copying."""
 
 import copy
 import gc
+import os
 import pickle
 import sys
 import unittest
 
-from support import PY3, Picklers
+from support import PY3, Picklers, RunPython
 from docsupport import (CEditResult, CScopeDocument, ErrorFields, Fields, Fresh, Outline, Place,
                         kSample)
 
@@ -138,6 +139,27 @@ class EditResultTest(DocumentTestCase):
         self.assertMatchesFresh(doc, text)
         self.assertEqual(doc.GetLastEditStats()['edits'], 3)
 
+    def testEditsFarApartAreReadEachWhereItIs(self):
+        text = ''.join('v%d = %d\n' % (k, k) for k in range(400))
+        doc = CScopeDocument(text)
+        keep = doc.GetLogicals()
+        # Bottom first, as an editor sends the edits of several cursors.
+        r = doc.EditMany([(300, 0, 300, 4, 'w300'), (2, 0, 2, 0, 'def f():\n    pass\n')])
+        self.assertLessEqual(doc.GetLastEditStats()['rows_scanned'], 4)
+        self.assertEqual([(l.fTokens[0], l.fLineno) for l in r.fAdded], [('def', 2), ('pass', 3), ('w300', 302)])
+        # A removed logical carries its number as the edits above it left it.
+        self.assertEqual([(l.fTokens[0], l.fLineno) for l in r.fRemoved], [('v299', 302)])
+        self.assertEqual(r.fRegion, (2, 299, 301))
+        self.assertEqual(sum(1 for a, b in zip(keep[1:], doc.GetLogicals()[3:]) if a is b), 398)
+        self.assertMatchesFresh(doc)
+
+    def testEditsThatMeetAreReadTogether(self):
+        doc = CScopeDocument(kSample)
+        # The first opens a bracket the second closes lines below.
+        r = doc.EditMany([(1, 9, 1, 9, ' (1,'), (3, 0, 3, 0, ')\n')])
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertMatchesFresh(doc)
+
     def testEmptyBatchAndSameText(self):
         doc = CScopeDocument(kSample)
         for r in (doc.EditMany([]), doc.SetText(kSample), doc.Edit(3, 2, 3, 2, '')):
@@ -254,6 +276,123 @@ class PicklingTest(DocumentTestCase):
         self.assertRaises(TypeError, doc.__setstate__, 5)
         self.assertRaises(ValueError, doc.__setstate__, '(')
         self.assertMatchesFresh(doc, 'x = 1\n')
+
+
+class ReadAgainOnlyWhatChangedTest(DocumentTestCase):
+    """The rows an edit reads again are bounded by what its state needs,
+    whatever the size of the text."""
+
+    def setUp(self):
+        self.text = kSample * 40      # 800 lines
+        self.doc = CScopeDocument(self.text)
+
+    def Stats(self, *edit):
+        self.doc.Edit(*edit)
+        return self.doc.GetLastEditStats()
+
+    def testTypingAndLinesReadOneLogical(self):
+        self.assertEqual(self.Stats(407, 16, 407, 16, 'y')['rows_scanned'], 1)
+        stats = self.Stats(407, 8, 407, 8, 'z = 1\n        ')
+        self.assertEqual((stats['rows_scanned'], stats['logicals_made']), (2, 2))
+        # A line put in reads itself and the line it pushed down.
+        self.assertEqual(self.Stats(405, 0, 405, 0, 'def new(self):\n')['rows_scanned'], 2)
+        # Inside a string spanning rows, its logical is read whole.
+        self.assertEqual(self.Stats(439, 5, 439, 5, 'more ')['rows_scanned'], 3)
+        self.assertMatchesFresh(self.doc)
+
+    def testOpeningAQuoteReadsToTheEndClosingItReadsALine(self):
+        stats = self.Stats(2, 0, 2, 0, "'''")
+        self.assertGreater(stats['rows_scanned'], 790)
+        self.assertFalse(stats['find_changes_called'])
+        r = self.doc.Edit(2, 0, 2, 3, '')
+        self.assertEqual(self.doc.GetLastEditStats()['rows_scanned'], 1)
+        self.assertEqual(r.fRegion, (2, 1, 1))
+        self.assertEqual((r.fAdded, r.fRemoved), ([], []))
+        self.assertMatchesFresh(self.doc, self.text)
+
+    def testABackslashJoinsAndSplitsLogicals(self):
+        # The blank line under a continued one is no logical of its own.
+        r = self.doc.Edit(1, 9, 1, 9, ' \\')
+        self.assertEqual(([l.fTokens for l in r.fAdded], [l.fKind for l in r.fRemoved]), ([], [22]))
+        self.assertMatchesFresh(self.doc)
+        r = self.doc.Edit(12, 16, 12, 16, ' \\')
+        self.assertEqual((len(r.fRemoved), [l.fTokens for l in r.fAdded]), (2, [('pass', 'return', 'inner')]))
+        self.assertMatchesFresh(self.doc)
+
+
+class IndentationBelowTheEditTest(DocumentTestCase):
+
+    def testADedentBelowIsCheckedAgainstTheNewStack(self):
+        text = 'if a:\n  if b:\n    x\n  y\n'
+        doc = CScopeDocument(text)
+        r = doc.Edit(2, 0, 2, 0, ' ')
+        self.assertEqual(r.fRegion, (2, 1, 1))
+        self.assertEqual((r.fError.msg, r.fError.lineno, r.fError.offset, r.fError.text),
+                         ('unindent does not match any outer indentation level', 4, 2, '  y\n'))
+        doc.SelfCheck()
+        r = doc.Edit(4, 0, 4, 0, ' ')
+        self.assertTrue(r.fReadable)
+        self.assertMatchesFresh(doc, 'if a:\n   if b:\n    x\n   y\n')
+
+    def testTheLinesKeptWhileTheTextDoesNotReadAreTheLastReadables(self):
+        doc = CScopeDocument(kSample)
+        doc.EditMany([(16, 7, 16, 7, '['), (3, 0, 3, 0, '  ')])
+        self.assertFalse(doc.IsReadable())
+        doc.SelfCheck()   # the rows outside the edits against the last text that read
+        doc.Edit(10, 0, 12, 0, '')
+        doc.SelfCheck()
+        r = doc.EditMany([(14, 7, 14, 8, ''), (3, 0, 3, 2, '')])
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertEqual([l.fTokens[:2] for l in r.fRemoved if l.fKind == 2], [('def', 'f'), ('def', 'inner')])
+        self.assertMatchesFresh(doc)
+
+    def testTheEmptyLastLineRunsNoCheck(self):
+        # The last line taken out leaves its row empty: what it held before
+        # must not be checked under a deeper block put in above.
+        doc = CScopeDocument('x = 1\n    y\n')
+        doc.Edit(2, 0, 3, 0, '')
+        doc.SelfCheck()
+        r = doc.Edit(1, 0, 1, 0, 'if a:\n        ')
+        self.assertTrue(r.fReadable, r.fError)
+        self.assertMatchesFresh(doc, 'if a:\n        x = 1\n')
+
+
+class HandEditedLogicalsTest(unittest.TestCase):
+
+    def testALineNumberChangedFromOutsideIsRefusedAndDetected(self):
+        doc = CScopeDocument(kSample)
+        doc.GetLogicals()[5].fLineno = 100
+        with self.assertRaises(RuntimeError):
+            doc.Edit(6, 0, 6, 0, '#')
+        self.assertEqual(doc.GetText(), kSample)
+        self.assertRaises(AssertionError, doc.SelfCheck)
+
+    def testANameChangedFromOutsideIsDetected(self):
+        doc = CScopeDocument(kSample)
+        doc.GetLogicals()[6].fScopeName = 'elsewhere'
+        with self.assertRaises(AssertionError) as caught:
+            doc.SelfCheck()
+        self.assertIn('elsewhere', str(caught.exception))
+
+
+class CheckEveryEditTest(unittest.TestCase):
+
+    def testTheEnvironmentSwitchChecksEachEdit(self):
+        code = """
+            from pysource.scopedocument import CScopeDocument
+            doc = CScopeDocument('def f():\\n    pass\\n')
+            doc.Edit(2, 4, 2, 8, 'return')
+            doc.GetLogicals()[1].fKind = 1
+            try:
+                doc.Edit(1, 0, 1, 0, '#')
+            except AssertionError as exc:
+                print('checked: %s' % str(exc).splitlines()[0])
+        """
+        status, out, err = RunPython(code, dict(os.environ, SBC_CHECK_DOCUMENT='1'))
+        self.assertEqual(status, 0, err)
+        self.assertIn('checked: the document differs', out)
+        status, out, err = RunPython(code, dict(os.environ, SBC_CHECK_DOCUMENT='0'))
+        self.assertEqual((status, out), (0, ''), err)
 
 
 class LeakTest(unittest.TestCase):

@@ -3,6 +3,7 @@ with a fresh read of the edited text and a whole-file pass (names, the
 outline, a warm body cache), or holds the reader's error for it."""
 
 import os
+import pickle
 import unittest
 
 from support import SANITIZED
@@ -10,7 +11,7 @@ from docsupport import (CScopeDocument, ErrorFields, Fields, Fresh, Outline, Pla
                         kSample)
 
 # Fewer edits under the sanitizers, where each costs ten times as much.
-kEdits = 150 if SANITIZED else 400
+kEdits = 300 if SANITIZED else 1200
 kSeed = int(os.environ.get('SBC_DOCUMENT_SEED', '1'))
 
 kTexts = [
@@ -68,6 +69,10 @@ class RandomEditsTest(unittest.TestCase):
                     doc.EditMany(edits)
                 else:
                     doc.Edit(*edits[0])
+                if step % 15 == 14:
+                    # Go on with a copy made by pickling: the same text, and the
+                    # same names of the last text that read.
+                    doc = pickle.loads(pickle.dumps(doc, 2))
                 try:
                     last_good = self.Check(doc, text, last_good)
                     doc.SelfCheck()

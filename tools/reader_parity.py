@@ -12,6 +12,18 @@ exits with 1 when any difference is not one the reader documents.
 
 --py2 and --py3 take a command or a version installed under pyenv. The records
 are read with the source tree's python/ package, so nothing needs building.
+
+With --native it compares instead, in the interpreter that runs it (with the
+built package on the path: scripts/python.sh), the native reader with the
+reference one (ReadLogicals(..., reference=True)): the same records or the
+same error (type and arguments) file by file, over each --root (default:
+this interpreter's standard library). With --adversarial COUNT it does so
+on COUNT generated texts (tools/reader_adversarial.py, --seed), checking
+too that a scan resumed at each row where no logical is open reads as the
+whole scan.
+
+    scripts/python.sh tools/reader_parity.py --native --root /usr/lib/python3/dist-packages
+    scripts/python.sh tools/reader_parity.py --adversarial 100000 --seed 1
 """
 
 from __future__ import print_function
@@ -238,10 +250,22 @@ def Main(argv):
     parser.add_argument('--root', help='directory to read (default: the 2.7 standard library)')
     parser.add_argument('--show', type=int, default=3, help='differing records shown per file')
     parser.add_argument('--worker', help=argparse.SUPPRESS)
-    args = parser.parse_args(argv)
+    parser.add_argument('--native', action='store_true',
+                        help='native reader against the reference, in this interpreter')
+    parser.add_argument('--adversarial', type=int, metavar='COUNT',
+                        help='native against reference on COUNT generated texts')
+    parser.add_argument('--seed', type=int, default=1, help='seed of the generated texts')
+    args, extra_roots = parser.parse_known_args(argv)
     if args.worker:
         Work(args.worker)
         return 0
+    if args.adversarial is not None:
+        return Adversarial(args.adversarial, args.seed)
+    if args.native:
+        roots = [r for r in [args.root] + extra_roots if r] or [os.path.dirname(os.__file__)]
+        return NativeParity(roots, args.show)
+    if extra_roots:
+        parser.error('unrecognized arguments: %s' % ' '.join(extra_roots))
     if not args.py3:
         parser.error('--py3 is required')
 
@@ -280,6 +304,66 @@ def Main(argv):
         print('a worker failed')
         return 2
     return 1 if unexplained else 0
+
+
+# --- Native against reference -------------------------------------------------
+
+def FileOutcome(path, reference):
+    """What ReadLogicalsFromFile gives for `path`, as plain data."""
+    from pysource.logicals import ReadLogicalsFromFile
+    try:
+        logicals = ReadLogicalsFromFile(path, reference=reference)
+    except Exception as exc:  # any failure is compared, not a crash of the tool
+        return ('error', type(exc).__name__, repr(exc.args))
+    return ('records', [(tuple(l.fTokens), l.fLineno, l.fIndent, l.fKind) for l in logicals])
+
+
+def NativeParity(roots, show):
+    sys.path.insert(0, kToolsDir)
+    from progress import Progress  # noqa: E402 (tools/)
+    paths = []
+    for root in roots:
+        paths.extend(SourceFiles(root) if os.path.isdir(root) else [root])
+    counts = dict.fromkeys(['identical', 'differing', 'records', 'rejected'], 0)
+    progress = Progress(len(paths))
+    for path in paths:
+        progress.Step(note=os.path.basename(path))
+        native, ref = FileOutcome(path, False), FileOutcome(path, True)
+        if native == ref:
+            counts['identical'] += 1
+            if native[0] == 'records':
+                counts['records'] += len(native[1])
+            else:
+                counts['rejected'] += 1
+            continue
+        counts['differing'] += 1
+        progress.Close()
+        print('%s: native and reference differ' % path)
+        if native[0] != ref[0] or native[0] == 'error':
+            print('    native:    %s' % (native if native[0] == 'error' else 'reads it'))
+            print('    reference: %s' % (ref if ref[0] == 'error' else 'reads it'))
+        else:
+            a, b = native[1], ref[1]
+            if len(a) != len(b):
+                print('    %d records native, %d reference' % (len(a), len(b)))
+            differing = [i for i, (x, y) in enumerate(zip(a, b)) if x != y]
+            for index in differing[:show]:
+                print('    record %d: native    %r' % (index, a[index]))
+                print('    record %d: reference %r' % (index, b[index]))
+    progress.Close()
+    print('Python %s, native against reference over %s' % (sys.version.split()[0], ', '.join(roots)))
+    print('files %d, identical %d (records %d, rejected alike %d), differing %d' % (
+        len(paths), counts['identical'], counts['records'], counts['rejected'], counts['differing']))
+    return 1 if counts['differing'] else 0
+
+
+def Adversarial(count, seed):
+    sys.path.insert(0, kToolsDir)
+    import reader_adversarial  # noqa: E402 (tools/)
+    differing = reader_adversarial.Run(seed, count, sys.stdout)
+    print('Python %s, native against reference: %d generated texts (seed %d), differing %d' % (
+        sys.version.split()[0], count, seed, differing))
+    return 1 if differing else 0
 
 
 def Tally(paths, workers, show):

@@ -263,6 +263,54 @@ inline PyObject* strFromChars(const uint32_t* p, Py_ssize_t n, bool) noexcept {
 }
 #endif
 
+// Holds off the cyclic collector while a native loop makes many objects
+// that hold no cycles (records of a read): the collections the allocations
+// would trigger find nothing there, and cost more the more the process
+// holds. The collector runs again as before once the pause ends; a pause
+// that cannot tell whether it runs does nothing.
+class GcPause {
+public:
+    GcPause() noexcept {
+#if PY_VERSION_HEX >= 0x030A0000
+        paused_ = PyGC_Disable() == 1;
+#else
+        py::SavedError saved;
+        static PyObject* gc = PyImport_ImportModule("gc");  // lives as long as the process
+        PyObject* r = gc ? PyObject_CallMethod(gc, const_cast<char*>("isenabled"), nullptr) : nullptr;
+        if (r == Py_True) {
+            PyObject* d = PyObject_CallMethod(gc, const_cast<char*>("disable"), nullptr);
+            paused_ = d != nullptr;
+            Py_XDECREF(d);
+        }
+        Py_XDECREF(r);
+        gc_ = gc;
+        PyErr_Clear();
+        saved.restore();
+#endif
+    }
+    ~GcPause() {
+#if PY_VERSION_HEX >= 0x030A0000
+        if (paused_) PyGC_Enable();
+#else
+        if (paused_) {
+            py::SavedError saved;
+            PyObject* r = PyObject_CallMethod(gc_, const_cast<char*>("enable"), nullptr);
+            Py_XDECREF(r);
+            PyErr_Clear();
+            saved.restore();
+        }
+#endif
+    }
+    GcPause(const GcPause&) = delete;
+    GcPause& operator=(const GcPause&) = delete;
+
+private:
+    bool paused_ = false;
+#if PY_VERSION_HEX < 0x030A0000
+    PyObject* gc_ = nullptr;
+#endif
+};
+
 // Whether two exact strs are equal.
 inline bool strEqual(PyObject* a, PyObject* b) noexcept {
 #if PY_MAJOR_VERSION >= 3

@@ -2,6 +2,7 @@
 
 #include <cstring>
 #include <limits>
+#include <vector>
 
 #include "common/pycompat.hpp"
 #include "common/pyref.hpp"
@@ -164,9 +165,68 @@ PyObject* makeLogicals(const Scanner<Char>& scanner, TokenMaker<Char>& tokens, c
     return list.release();
 }
 
+namespace {
+
+// The objects made so far, released unless handed to a list.
+struct Made {
+    std::vector<PyObject*> objects;
+    ~Made() {
+        for (PyObject* o : objects) Py_DECREF(o);
+    }
+};
+
+template <class Char>
+void makeBatch(const Scanner<Char>& scanner, TokenMaker<Char>& tokens, const RecordMaker& maker, Made* made) {
+    for (const Record& record : scanner.records()) {
+        PyObject* logical = makeLogical(scanner, record, tokens, maker);
+        if (logical == nullptr) py::fail();
+        made->objects.push_back(logical);
+    }
+}
+
+// Batches of about this many records keep a batch's spans and records in
+// the first-level caches.
+constexpr size_t kBatchRecords = 256;
+// Texts this long make enough objects for the collector's runs to show.
+constexpr size_t kPauseGcAt = 16384;
+
+}  // namespace
+
+template <class Char>
+PyObject* readLogicals(Scanner<Char>& scanner, TokenMaker<Char>& tokens, const RecordMaker& maker,
+                       PyObject* filename) {
+    return py::guarded([&]() -> PyObject* {
+        // Only the record type's own slots run while records are made; a
+        // callable given in its place runs with the collector as it is.
+        const bool pause = scanner.length() >= kPauseGcAt && maker.native != nullptr &&
+                           maker.type == reinterpret_cast<PyObject*>(maker.native);
+        std::unique_ptr<compat::GcPause> paused(pause ? new compat::GcPause : nullptr);
+        Made made;
+        made.objects.reserve(scanner.length() / 40 + 16);
+        while (scanner.scanRow()) {
+            if (scanner.records().size() >= kBatchRecords && !scanner.state().midLogical()) {
+                makeBatch(scanner, tokens, maker, &made);
+                scanner.clearOutput();
+            }
+        }
+        if (!scanner.error()) scanner.finish();
+        makeBatch(scanner, tokens, maker, &made);
+        if (scanner.error()) {
+            setScanError(scanner, tokens, filename);
+            py::fail();
+        }
+        py::Ref list = py::check(PyList_New(static_cast<Py_ssize_t>(made.objects.size())));
+        for (size_t i = 0; i < made.objects.size(); ++i)
+            PyList_SET_ITEM(list.get(), static_cast<Py_ssize_t>(i), made.objects[i]);
+        made.objects.clear();
+        return list.release();
+    });
+}
+
 template class TokenMaker<uint8_t>;
 template PyObject* makeLogical(const Scanner<uint8_t>&, const Record&, TokenMaker<uint8_t>&, const RecordMaker&);
 template PyObject* makeLogicals(const Scanner<uint8_t>&, TokenMaker<uint8_t>&, const RecordMaker&, PyObject*);
+template PyObject* readLogicals(Scanner<uint8_t>&, TokenMaker<uint8_t>&, const RecordMaker&, PyObject*);
 template void setScanError(const Scanner<uint8_t>&, TokenMaker<uint8_t>&, PyObject*);
 #if PY_MAJOR_VERSION >= 3
 template class TokenMaker<uint16_t>;
@@ -176,6 +236,8 @@ template PyObject* makeLogical(const Scanner<uint32_t>&, const Record&, TokenMak
 template PyObject* makeLogicals(const Scanner<uint16_t>&, TokenMaker<uint16_t>&, const RecordMaker&, PyObject*);
 template PyObject* makeLogicals(const Scanner<uint32_t>&, TokenMaker<uint32_t>&, const RecordMaker&, PyObject*);
 template void setScanError(const Scanner<uint16_t>&, TokenMaker<uint16_t>&, PyObject*);
+template PyObject* readLogicals(Scanner<uint16_t>&, TokenMaker<uint16_t>&, const RecordMaker&, PyObject*);
+template PyObject* readLogicals(Scanner<uint32_t>&, TokenMaker<uint32_t>&, const RecordMaker&, PyObject*);
 template void setScanError(const Scanner<uint32_t>&, TokenMaker<uint32_t>&, PyObject*);
 #endif
 

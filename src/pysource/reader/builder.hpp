@@ -64,6 +64,14 @@ template <class Char>
 PyObject* makeLogicals(const Scanner<Char>& scanner, TokenMaker<Char>& tokens, const RecordMaker& maker,
                        PyObject* filename);
 
+// Reads the whole text from where `scanner` stands and makes the list of its
+// logicals, or sets the reference's exception. Records are made a few
+// hundred at a time as the scan goes, while their spans are still in the
+// caches, and the scanner's output is dropped after each batch.
+template <class Char>
+PyObject* readLogicals(Scanner<Char>& scanner, TokenMaker<Char>& tokens, const RecordMaker& maker,
+                       PyObject* filename);
+
 // Sets the exception the reference raises for the scan's error.
 template <class Char>
 void setScanError(const Scanner<Char>& scanner, TokenMaker<Char>& tokens, PyObject* filename);

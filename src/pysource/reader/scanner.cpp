@@ -8,6 +8,7 @@
 
 #include <algorithm>
 #include <climits>
+#include <cstring>
 
 namespace reader {
 
@@ -224,6 +225,20 @@ inline bool endsWithBackslashNewline(const Char* line, size_t max) {
            (max >= 3 && line[max - 1] == '\n' && line[max - 2] == '\r' && line[max - 3] == '\\');
 }
 
+// The length of the row at `line` with its '\n', at most `left`.
+template <class Char>
+inline size_t rowLength(const Char* line, size_t left) {
+    for (size_t i = 0; i < left; ++i)
+        if (line[i] == '\n') return i + 1;
+    return left;
+}
+
+template <>
+inline size_t rowLength<uint8_t>(const uint8_t* line, size_t left) {
+    const void* newline = std::memchr(line, '\n', left);
+    return newline ? static_cast<size_t>(static_cast<const uint8_t*>(newline) - line) + 1 : left;
+}
+
 template <class Char>
 inline bool isPrefixLetter(Char c) {
     return c == 'u' || c == 'U' || c == 'b' || c == 'B' || c == 'r' || c == 'R';
@@ -372,13 +387,7 @@ bool Scanner<Char>::scanRow() {
     if (error_ || stopped_ || pos_ >= length_) return false;
     const size_t rowStart = pos_;
     const Char* line = text_ + rowStart;
-    size_t max = length_ - rowStart;
-    for (size_t i = 0; i < max; ++i) {
-        if (line[i] == '\n') {
-            max = i + 1;
-            break;
-        }
-    }
+    const size_t max = rowLength(line, length_ - rowStart);
     pos_ = rowStart + max;
     const int64_t lnum = ++lnum_;
     rowIndentColumn_ = -1;

@@ -23,20 +23,32 @@
 
 namespace sdoc {
 
-// The part of the current text that differs from the baseline's: current
+// A part of the current text that differs from the baseline's: current
 // characters [start, end) stand where the baseline had `baselineMiddle`.
-struct Damage {
-    bool active = false;
+struct DamageRange {
     size_t start = 0;
     size_t end = 0;
     std::vector<uint32_t> baselineMiddle;
-    long lineDelta = 0;       // current rows minus baseline rows
+    long lineDelta = 0;  // rows it added (negative: took out)
     // The least indentation column among the baseline's rows that edits
     // took out of the row table (INT64_MAX: none), and how many rows they took.
     int64_t droppedMinColumn = INT64_MAX;
     size_t rowsDropped = 0;
+};
+
+// Where the current text differs from the baseline's: ranges in text order,
+// apart from each other. Between them the text is the baseline's.
+struct Damage {
+    std::vector<DamageRange> ranges;
     size_t baselineRows = 0;  // rows of the baseline text
     bool baselineEndsWithNewline = false;
+
+    bool active() const noexcept { return !ranges.empty(); }
+    long lineDelta() const noexcept {
+        long delta = 0;
+        for (const DamageRange& r : ranges) delta += r.lineDelta;
+        return delta;
+    }
 };
 
 struct EditStats {
@@ -91,6 +103,19 @@ struct EditOutcome {
     size_t regionFirstLine = 1, regionOldLines = 0, regionNewLines = 0;
 };
 
+// Refuses a call that comes back into the document while it is being
+// changed or checked (Python code run meanwhile).
+class BusyGuard {
+public:
+    explicit BusyGuard(Document& d);
+    ~BusyGuard() { d_.busy = false; }
+    BusyGuard(const BusyGuard&) = delete;
+    BusyGuard& operator=(const BusyGuard&) = delete;
+
+private:
+    Document& d_;
+};
+
 // --- document_type.cpp -----------------------------------------------------------
 PyTypeObject* documentType() noexcept;
 void readyDocumentType();
@@ -137,6 +162,9 @@ void reread(Document& d, EditOutcome& out);
 // How the rows' states and columns differ from a whole scan of the text
 // (empty when they agree). Only for a text that reads.
 std::string checkRowStates(Document& d);
+// The same for a text that does not read: the rows outside the damage
+// against a whole scan of `baseline`, the last text that read.
+std::string checkBaselineRows(Document& d, PyObject* baseline);
 // The length of a leading BOM of the text (0 without one).
 size_t bomLength(const Document& d);
 
@@ -148,6 +176,9 @@ py::Ref logicalsCopy(Document& d);
 
 // --- pickling.cpp ------------------------------------------------------------------------
 py::Ref reduceDocument(PyObject* self, Document& d);
+// The text of the last readable text (the current one with the damage put
+// back).
+py::Ref baselineText(Document& d);
 void restoreDocument(PyObject* self, PyObject* state);
 
 // --- self_check.cpp ---------------------------------------------------------------------
@@ -161,7 +192,6 @@ py::Ref makeEditResult(Document& d, EditOutcome& outcome);
 // --- imports.cpp -------------------------------------------------------------------------
 // What the document uses of the other modules, bound at import.
 struct Imports {
-    PyObject* readLogicals;     // pysource.logicals.ReadLogicals
     PyObject* decodeSource;     // pysource.logicals._SourceText (3.x bytes)
     PyObject* changeFinder;     // pysource.scopebodycache.CChangeFinder
     PyObject* bodyCache;        // pysource.scopebodycache.CScopeBodyCache

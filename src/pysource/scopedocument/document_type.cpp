@@ -206,6 +206,7 @@ PyObject* m_GetOutline(PyObject* self, PyObject*) {
 PyObject* m_GetBodyOfScope(PyObject* self, PyObject* name) {
     return py::guarded([&]() -> PyObject* {
         Document& d = ready(self);
+        BusyGuard busy(d);
         py::Ref body = py::check(
             PyObject_CallMethod(d.cache.get(), const_cast<char*>("GetBodyOfScope"), const_cast<char*>("(O)"), name));
         if (PyList_Check(body.get())) return PyList_GetSlice(body.get(), 0, PyList_GET_SIZE(body.get()));
@@ -216,6 +217,7 @@ PyObject* m_GetBodyOfScope(PyObject* self, PyObject* name) {
 PyObject* m_GetScopeDef(PyObject* self, PyObject* name) {
     return py::guarded([&]() -> PyObject* {
         Document& d = ready(self);
+        BusyGuard busy(d);
         return py::check(PyObject_CallMethod(d.cache.get(), const_cast<char*>("GetScopeDef"), const_cast<char*>("(O)"),
                                              name))
             .release();
@@ -224,7 +226,9 @@ PyObject* m_GetScopeDef(PyObject* self, PyObject* name) {
 
 PyObject* m_SelfCheck(PyObject* self, PyObject*) {
     return py::guarded([&]() -> PyObject* {
-        selfCheck(ready(self));
+        Document& d = ready(self);
+        BusyGuard busy(d);
+        selfCheck(d);
         return py::Ref::none().release();
     });
 }
@@ -244,9 +248,11 @@ PyObject* m_GetLastEditStats(PyObject* self, PyObject*) {
 PyObject* m_MemoryUse(PyObject* self, PyObject*) {
     return py::guarded([&]() -> PyObject* {
         Document& d = ready(self);
+        size_t damage = 0;
+        for (const DamageRange& r : d.damage.ranges) damage += r.baselineMiddle.capacity() * sizeof(uint32_t);
         return Py_BuildValue("{s:n,s:n,s:n}", "text", static_cast<Py_ssize_t>(d.text.bytesHeld()), "rows",
                              static_cast<Py_ssize_t>(d.rows.bytesHeld()), "damage",
-                             static_cast<Py_ssize_t>(d.damage.baselineMiddle.capacity() * sizeof(uint32_t)));
+                             static_cast<Py_ssize_t>(damage));
     });
 }
 
@@ -256,7 +262,8 @@ PyObject* m_reduce(PyObject* self, PyObject*) {
 
 PyObject* m_setstate(PyObject* self, PyObject* state) {
     return py::guarded([&]() -> PyObject* {
-        ready(self);
+        Document& d = ready(self);
+        if (d.busy) msg::raise(PyExc_RuntimeError, "the document is being edited (a call came back into it)");
         restoreDocument(self, state);
         return py::Ref::none().release();
     });

@@ -3,27 +3,25 @@
 //
 // A batch of edits is applied to the text in order; every edit is checked
 // against the text the ones before it left, and a bad one undoes them all.
-// The span the batch touched (with what the baseline held there) is the
-// damage. The text is then read: when it reads, the logicals that differ
-// from the list's replace them (the same objects stay for the rest, with
-// their line numbers shifted), FindChanges names them and the cache forgets
-// the changed scopes; when it does not, the list stays as the baseline and
-// the damage stays for the next edit.
+// The ranges the batch touched (with what the baseline held there) join the
+// damage. The damage is then read again (reread.cpp): when the text reads,
+// the logicals that differ from the list's replace them (the same objects
+// stay for the rest, with their line numbers shifted), FindChanges names
+// them and the cache forgets the changed scopes; when it does not, the list
+// stays as the baseline and the damage stays for the next edit.
 //
-// Python code runs here only in the reader, the finder and the cache (all
-// of them the project's own, on the document's private list) and in the
-// destructors of the logicals dropped; `busy` refuses a call that comes
-// back into the document meanwhile.
+// Python code runs here only in the finder and the cache (the project's own,
+// on the document's private list), in the self-check and in the destructors
+// of the logicals dropped; `busy` refuses a call that comes back into the
+// document meanwhile.
 #include "common/messages.hpp"
 #include "common/pycompat.hpp"
-#include "pysource/contracts/logical_record.hpp"
 #include "pysource/scopedocument/document.hpp"
 
 #include <algorithm>
 
 namespace sdoc {
 
-using contracts::LogicalLineObject;
 
 bool gCheckEveryEdit = false;
 
@@ -72,37 +70,48 @@ void replaceText(Document& d, size_t start, size_t end, const void* data, int wi
 bool endsWithNewline(const TextStore& t) { return t.size() > 0 && t.at(t.size() - 1) == '\n'; }
 
 // Widens the damage to cover characters [start, end) of the text as it
-// stands before an edit that puts `n` characters there.
+// stands before an edit that puts `n` characters there: the ranges it
+// meets or touches become one.
 void extendDamage(Document& d, size_t start, size_t end, size_t n, size_t newlinesRemoved, size_t newlinesAdded,
                   const DroppedRows& dropped) {
     Damage& g = d.damage;
-    if (!g.active) {
-        g.active = true;
-        g.start = start;
-        g.end = end;
-        g.baselineMiddle.clear();
-        d.text.copyOut(start, end, g.baselineMiddle);
-        g.lineDelta = 0;
+    if (!g.active()) {
         g.baselineRows = d.rows.count();
         g.baselineEndsWithNewline = endsWithNewline(d.text);
-    } else {
-        if (start < g.start) {
-            std::vector<uint32_t> head;
-            d.text.copyOut(start, g.start, head);
-            g.baselineMiddle.insert(g.baselineMiddle.begin(), head.begin(), head.end());
-            g.start = start;
-        }
-        if (end > g.end) {
-            d.text.copyOut(g.end, end, g.baselineMiddle);
-            g.end = end;
-        }
     }
-    g.end = g.end + n - (end - start);
-    g.rowsDropped += dropped.columns.size();
+    std::vector<DamageRange>& ranges = g.ranges;
+    size_t lo = 0;
+    while (lo < ranges.size() && ranges[lo].end < start) ++lo;
+    size_t hi = lo;
+    while (hi < ranges.size() && ranges[hi].start <= end) ++hi;
+    DamageRange merged;
+    merged.start = lo < hi ? std::min(start, ranges[lo].start) : start;
+    const size_t mergedEnd = lo < hi ? std::max(end, ranges[hi - 1].end) : end;
+    size_t at = merged.start;
+    for (size_t k = lo; k < hi; ++k) {
+        // Between ranges the text is the baseline's.
+        d.text.copyOut(at, ranges[k].start, merged.baselineMiddle);
+        merged.baselineMiddle.insert(merged.baselineMiddle.end(), ranges[k].baselineMiddle.begin(),
+                                     ranges[k].baselineMiddle.end());
+        merged.lineDelta += ranges[k].lineDelta;
+        merged.droppedMinColumn = std::min(merged.droppedMinColumn, ranges[k].droppedMinColumn);
+        merged.rowsDropped += ranges[k].rowsDropped;
+        at = ranges[k].end;
+    }
+    d.text.copyOut(at, mergedEnd, merged.baselineMiddle);
+    const long shift = static_cast<long>(n) - static_cast<long>(end - start);
+    merged.end = static_cast<size_t>(static_cast<long>(mergedEnd) + shift);
+    merged.lineDelta += static_cast<long>(newlinesAdded) - static_cast<long>(newlinesRemoved);
+    merged.rowsDropped += dropped.columns.size();
     for (int16_t c : dropped.columns) {
-        if (c >= 0) g.droppedMinColumn = std::min<int64_t>(g.droppedMinColumn, c);
+        if (c >= 0) merged.droppedMinColumn = std::min<int64_t>(merged.droppedMinColumn, c);
     }
-    g.lineDelta += static_cast<long>(newlinesAdded) - static_cast<long>(newlinesRemoved);
+    for (size_t k = hi; k < ranges.size(); ++k) {
+        ranges[k].start = static_cast<size_t>(static_cast<long>(ranges[k].start) + shift);
+        ranges[k].end = static_cast<size_t>(static_cast<long>(ranges[k].end) + shift);
+    }
+    ranges.erase(ranges.begin() + static_cast<std::ptrdiff_t>(lo), ranges.begin() + static_cast<std::ptrdiff_t>(hi));
+    ranges.insert(ranges.begin() + static_cast<std::ptrdiff_t>(lo), std::move(merged));
 }
 
 struct Undo {
@@ -185,17 +194,6 @@ py::Ref finishEdit(Document& d, EditOutcome& out) {
     return result;
 }
 
-class BusyGuard {
-public:
-    explicit BusyGuard(Document& d) : d_(d) {
-        if (d.busy) msg::raise(PyExc_RuntimeError, "the document is being edited (a call came back into it)");
-        d.busy = true;
-    }
-    ~BusyGuard() { d_.busy = false; }
-
-private:
-    Document& d_;
-};
 
 }  // namespace
 
@@ -223,10 +221,11 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
         d.readable = true;
     } else {
         // The baseline is the empty text.
-        d.damage.active = true;
-        d.damage.start = 0;
-        d.damage.end = d.text.size();
-        d.damage.lineDelta = static_cast<long>(d.rows.count()) - 1;
+        DamageRange all;
+        all.start = 0;
+        all.end = d.text.size();
+        all.lineDelta = static_cast<long>(d.rows.count()) - 1;
+        d.damage.ranges.push_back(std::move(all));
         d.damage.baselineRows = 1;
         d.damage.baselineEndsWithNewline = false;
     }

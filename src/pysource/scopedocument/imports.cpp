@@ -17,7 +17,6 @@ PyObject* attributeOf(const char* module, const char* name) {
 }  // namespace
 
 void bindImports() {
-    gImports.readLogicals = attributeOf("pysource.logicals", "ReadLogicals");
     gImports.decodeSource = attributeOf("pysource.logicals", "_SourceText");
     gImports.changeFinder = attributeOf("pysource.scopebodycache", "CChangeFinder");
     gImports.bodyCache = attributeOf("pysource.scopebodycache", "CScopeBodyCache");

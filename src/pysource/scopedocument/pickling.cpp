@@ -10,19 +10,18 @@
 
 namespace sdoc {
 
-namespace {
-
 // The baseline's text: the current one with the damage put back.
 py::Ref baselineText(Document& d) {
-    const Damage& g = d.damage;
     std::vector<uint32_t> chars;
-    d.text.copyOut(0, g.start, chars);
-    chars.insert(chars.end(), g.baselineMiddle.begin(), g.baselineMiddle.end());
-    d.text.copyOut(g.end, d.text.size(), chars);
+    size_t at = 0;
+    for (const DamageRange& r : d.damage.ranges) {
+        d.text.copyOut(at, r.start, chars);
+        chars.insert(chars.end(), r.baselineMiddle.begin(), r.baselineMiddle.end());
+        at = r.end;
+    }
+    d.text.copyOut(at, d.text.size(), chars);
     return py::check(compat::strFromWidth(chars.data(), 4, static_cast<Py_ssize_t>(chars.size())));
 }
-
-}  // namespace
 
 py::Ref reduceDocument(PyObject* self, Document& d) {
     py::Ref state = d.readable ? py::Ref::none() : baselineText(d);

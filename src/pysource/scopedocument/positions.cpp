@@ -110,6 +110,11 @@ size_t offsetOf(Document& d, PyObject* linenoArg, PyObject* columnArg, bool utf1
     return at;
 }
 
+BusyGuard::BusyGuard(Document& d) : d_(d) {
+    if (d.busy) msg::raise(PyExc_RuntimeError, "the document is being edited (a call came back into it)");
+    d.busy = true;
+}
+
 void requireEditText(PyObject* text) {
     if (compat::isStr(text)) return;
     PyErr_Format(PyExc_TypeError, "the new text must be %s, not %.200s", compat::kPython3 ? "str" : "str (bytes)",

@@ -21,7 +21,7 @@ Py_ssize_t linenoArgument(PyObject* value) {
         PyErr_Format(PyExc_TypeError, "lineno must be an int, not %.200s", Py_TYPE(value)->tp_name);
         py::fail();
     }
-    const Py_ssize_t v = PyNumber_AsSsize_t(value, PyExc_OverflowError);
+    const Py_ssize_t v = PyNumber_AsSsize_t(value, nullptr);  // clipped: a line past the end is past the end
     if (v == -1 && PyErr_Occurred()) py::fail();
     return v;
 }

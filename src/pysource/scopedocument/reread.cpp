@@ -72,9 +72,10 @@ bool sameSignature(PyObject* a, PyObject* b) noexcept {
     return true;
 }
 
-// The first index of the list whose logical is at or after `lineno`.
-Py_ssize_t lowerBound(PyObject* list, int64_t lineno) {
-    Py_ssize_t lo = 0, hi = PyList_GET_SIZE(list);
+// The first index of the list, from `lo` on, whose logical is at or after
+// `lineno`.
+Py_ssize_t lowerBound(PyObject* list, Py_ssize_t lo, int64_t lineno) {
+    Py_ssize_t hi = PyList_GET_SIZE(list);
     while (lo < hi) {
         const Py_ssize_t mid = lo + (hi - lo) / 2;
         if (record(PyList_GET_ITEM(list, mid))->fLineno < lineno) lo = mid + 1;
@@ -85,12 +86,15 @@ Py_ssize_t lowerBound(PyObject* list, int64_t lineno) {
 
 // The indentation stack at the start of row r: the successive least columns
 // walking up from it (each row that ran the check left the stack as the
-// columns below its own, then its own).
-std::vector<int64_t> stackAt(Document& d, size_t r) {
+// columns below its own, then its own). Rows from `unchangedAbove` on may
+// have changed since the last edit.
+std::vector<int64_t> stackAt(Document& d, size_t r, size_t unchangedAbove) {
     std::vector<int64_t> down;
     int64_t limit = INT64_MAX;
+    // The stack kept from the last edit holds while no row above its own
+    // has changed since: the damage starts below it.
     const StackCache& cache = d.stackCache;
-    const bool cached = cache.valid && cache.row <= r;
+    const bool cached = cache.valid && cache.row <= r && cache.row <= unchangedAbove;
     const size_t stop = cached ? cache.row : 0;
     for (size_t j = r; j > stop && limit > 0;) {
         --j;
@@ -166,13 +170,16 @@ void setUnreadable(Document& d, py::Ref error) {
     d.readable = false;
 }
 
-// Rows from `from` down: each column checked against `stack` until one is
-// at most `limit` (both versions then have the same stack). False, with
-// the document's error set, at a dedent to a column not on the stack.
-bool checkRowsBelow(Document& d, std::vector<int64_t> stack, size_t from, int64_t limit) {
+enum class Walk { kAgreed, kStopped, kError };
+
+// Rows [from, until): each column checked against the new `stack` (kept up
+// to date) until one is at most `limit`, where the old and the new stacks
+// agree again (kAgreed). kStopped when `until` comes first; kError, with the
+// document's error set, at a dedent to a column not on the stack.
+Walk walkRows(Document& d, std::vector<int64_t>& stack, size_t from, size_t until, int64_t limit) {
     const size_t count = d.rows.count();
     const size_t n = d.text.size();
-    for (size_t j = from; j < count; ++j) {
+    for (size_t j = from; j < until; ++j) {
         const int64_t c = d.rows.column(j);
         if (c < 0) continue;
         if (c > stack.back()) stack.push_back(c);
@@ -189,20 +196,39 @@ bool checkRowsBelow(Document& d, std::vector<int64_t> stack, size_t from, int64_
                 py::Ref text = py::Ref::steal(d.text.slice(start, end));
                 setUnreadable(d, makeError(d, ErrorKind::kIndentation, static_cast<int64_t>(j) + 1,
                                            static_cast<int64_t>(pos - start), std::move(text)));
-                return false;
+                return Walk::kError;
             }
             stack.pop_back();
         }
-        if (c <= limit) return true;
+        if (c <= limit) return Walk::kAgreed;
     }
-    return true;
+    return Walk::kStopped;
 }
 
-void shiftBelow(PyObject* list, Py_ssize_t from, long delta) {
-    if (delta == 0) return;
+// The logicals are the document's own, but a caller holding one can set its
+// line number. Around the re-read ones they must still be in order, or the
+// place found for them would be wrong.
+void requireInOrder(PyObject* list, Py_ssize_t i0, Py_ssize_t i1) {
     const Py_ssize_t n = PyList_GET_SIZE(list);
+    const Py_ssize_t from = i0 > 0 ? i0 - 1 : 0;
+    const Py_ssize_t to = std::min(n, i1 + 2);
+    for (Py_ssize_t k = from; k + 1 < to; ++k) {
+        const int32_t a = record(PyList_GET_ITEM(list, k))->fLineno;
+        const int32_t b = record(PyList_GET_ITEM(list, k + 1))->fLineno;
+        if (a > b) {
+            PyErr_Format(PyExc_RuntimeError,
+                         "the document's logicals were changed from outside (line %d before line %d); "
+                         "the edit is not made (SelfCheck() describes the difference)",
+                         static_cast<int>(a), static_cast<int>(b));
+            py::fail();
+        }
+    }
+}
+
+void shiftLines(PyObject* list, Py_ssize_t from, Py_ssize_t to, long delta) {
+    if (delta == 0) return;
     PyObject** items = &PyList_GET_ITEM(list, 0);
-    for (Py_ssize_t i = from; i < n; ++i) record(items[i])->fLineno += static_cast<int32_t>(delta);
+    for (Py_ssize_t i = from; i < to; ++i) record(items[i])->fLineno += static_cast<int32_t>(delta);
 }
 
 void clearCache(Document& d, PyObject* changes) {
@@ -229,7 +255,7 @@ py::Ref makeLogicals(const Scanner<Char>& scanner, const Char* text, Document& d
         if (logical == nullptr) py::fail();
         PyList_SET_ITEM(list.get(), static_cast<Py_ssize_t>(i), logical);
     }
-    d.stats.logicalsMade = records.size();
+    d.stats.logicalsMade += records.size();
     return list;
 }
 
@@ -259,104 +285,220 @@ py::Ref readWholeAs(Document& d) {
     return makeLogicals(scanner, p, d);
 }
 
+// The rows read again for one or more damage ranges (a read that runs into
+// the next range takes it in), and what they read into.
+struct GroupRead {
+    size_t first = 0;
+    size_t end = 0;  // rows [first, end) read: to the row it converged at, or all
+    bool converged = false;
+    bool stopped = false;  // a last row of only whitespace ended the text
+    long lineDelta = 0;    // rows its ranges added
+    std::vector<RowState> states;
+    std::vector<int16_t> columns;
+    std::vector<int64_t> stack;  // in force at `first`
+    py::Ref fresh;               // its logicals
+    Py_ssize_t i0 = 0;           // its old logicals in the list: [i0, i1)
+    Py_ssize_t i1 = 0;
+};
+
+// Reads the groups of damage ranges in text order. Nothing of the document
+// changes until every group reads; the text stops at the first that does
+// not. Then each group's logicals replace its old ones, top to bottom: a
+// removed logical carries the line number the groups above it left, as the
+// editing protocol has it, and one FindChanges call takes them all.
 template <class Char>
 void rereadAs(Document& d, EditOutcome& out) {
     Damage& g = d.damage;
     const size_t n = d.text.size();
     const size_t count = d.rows.count();
-    size_t first = rowOfOffset(d, g.start) - 1;
-    while (first > 0 && unpack(d.rows.state(first)).midLogical()) --first;
-    // Rows from `comparable` on are the baseline's rows, shifted.
-    const size_t comparable = rowOfOffset(d, g.end);
-    std::vector<int64_t> stack = stackAt(d, first);
-    const size_t base = d.rows.start(first, n) + (first == 0 ? bomLength(d) : 0);
-    const Char* p = static_cast<const Char*>(d.text.contiguousFrom(base));
-    Scanner<Char> scanner(p, n - base);
-    scanner.start(static_cast<int64_t>(first) + 1, 0, unpack(d.rows.state(first)), stack.data(), stack.size());
+    const std::vector<DamageRange>& ranges = g.ranges;
+    const size_t rangeCount = ranges.size();
+    // Where each range starts, and the first row after it (from there the
+    // rows are the baseline's, shifted).
+    std::vector<size_t> startRow(rangeCount), afterRow(rangeCount);
+    for (size_t k = 0; k < rangeCount; ++k) {
+        startRow[k] = rowOfOffset(d, ranges[k].start) - 1;
+        afterRow[k] = rowOfOffset(d, ranges[k].end);
+    }
+    auto cleanAbove = [&](size_t r) {
+        while (r > 0 && unpack(d.rows.state(r)).midLogical()) --r;
+        return r;
+    };
+    auto region = [&](const std::vector<GroupRead>& groups) {
+        long delta = 0;
+        for (const GroupRead& G : groups) delta += G.lineDelta;
+        const GroupRead& last = groups.back();
+        out.regionFirstLine = groups.front().first + 1;
+        out.regionNewLines = last.end - groups.front().first;
+        out.regionOldLines = static_cast<size_t>(static_cast<long>(out.regionNewLines) - delta);
+    };
 
-    std::vector<RowState> states;
-    std::vector<int16_t> columns;
-    size_t row = first;
-    bool converged = false;
-    while (scanner.scanRow()) {
-        columns.push_back(columnOf(scanner.rowIndentColumn()));
-        ++row;
-        const LineState s = scanner.state();
-        states.push_back(pack(s));
-        if (row >= comparable && row < count && !s.midLogical() && pack(s) == d.rows.state(row)) {
-            converged = true;
-            break;
+    std::vector<GroupRead> groups;
+    // The stacks below the rows read may differ until a row's column is at
+    // most `pending`; a walk cut short by the next group hands its stack on.
+    int64_t pending = INT64_MAX;
+    bool carry = false;
+    std::vector<int64_t> carried;
+    for (size_t j = 0; j < rangeCount;) {
+        groups.emplace_back();
+        GroupRead& G = groups.back();
+        G.first = cleanAbove(startRow[j]);
+        G.stack = carry ? std::move(carried) : stackAt(d, G.first, startRow[0]);
+        carry = false;
+        size_t last = j;
+        size_t comparable = afterRow[j];
+        bool sameRows = true;
+        int64_t droppedLeast = INT64_MAX;
+        auto takeIn = [&](size_t k) {
+            G.lineDelta += ranges[k].lineDelta;
+            sameRows = sameRows && ranges[k].lineDelta == 0 && ranges[k].rowsDropped == 0;
+            droppedLeast = std::min(droppedLeast, ranges[k].droppedMinColumn);
+        };
+        takeIn(j);
+        const size_t base = d.rows.start(G.first, n) + (G.first == 0 ? bomLength(d) : 0);
+        const Char* p = static_cast<const Char*>(d.text.contiguousFrom(base));
+        Scanner<Char> scanner(p, n - base);
+        scanner.start(static_cast<int64_t>(G.first) + 1, 0, unpack(d.rows.state(G.first)), G.stack.data(),
+                      G.stack.size());
+        size_t row = G.first;
+        while (scanner.scanRow()) {
+            G.columns.push_back(columnOf(scanner.rowIndentColumn()));
+            ++row;
+            const LineState s = scanner.state();
+            G.states.push_back(pack(s));
+            // A range that starts in a row read joins this read.
+            while (last + 1 < rangeCount && row > startRow[last + 1]) {
+                takeIn(++last);
+                comparable = afterRow[last];
+            }
+            if (row >= comparable && row < count && !s.midLogical() && pack(s) == d.rows.state(row)) {
+                G.converged = true;
+                break;
+            }
+            // So does one that starts in the next row, unless the read stops
+            // above it.
+            while (last + 1 < rangeCount && row >= startRow[last + 1]) {
+                takeIn(++last);
+                comparable = afterRow[last];
+            }
+        }
+        G.stopped = !G.converged && !scanner.error() && scanner.atEnd() && row < count && d.rows.start(row, n) < n;
+        d.stats.rowsScanned += row - G.first + (G.stopped ? 1 : 0);
+        if (!G.converged) {
+            while (last + 1 < rangeCount) takeIn(++last);
+            if (!scanner.error()) scanner.finish();
+        }
+        G.end = G.converged ? row : count;
+        if (scanner.error()) {
+            region(groups);
+            setUnreadable(d, scanError(d, scanner, base));
+            return;
+        }
+        if (G.converged) {
+            // Typing that keeps every row's column leaves the stacks alone.
+            bool sameColumns = sameRows;
+            int64_t least = INT64_MAX;
+            int64_t leastOld = droppedLeast;
+            for (size_t r = G.first; r < row; ++r) {
+                const int16_t mine = G.columns[r - G.first];
+                const int16_t old = d.rows.column(r);
+                sameColumns = sameColumns && mine == old;
+                if (mine >= 0) least = std::min<int64_t>(least, mine);
+                if (old >= 0) leastOld = std::min<int64_t>(leastOld, old);
+            }
+            if (!sameColumns) pending = std::min(pending, std::min(least, leastOld));
+        }
+        // Made now: the next group's read moves the text.
+        p = static_cast<const Char*>(d.text.contiguousFrom(base));
+        G.fresh = makeLogicals(scanner, p, d);
+        j = last + 1;
+        if (G.converged && pending != INT64_MAX) {
+            const size_t until = j < rangeCount ? cleanAbove(startRow[j]) : count;
+            std::vector<int64_t> stack = scanner.indents();
+            const Walk walk = walkRows(d, stack, row, until, pending);
+            if (walk == Walk::kError) {
+                region(groups);
+                return;
+            }
+            if (walk == Walk::kAgreed || j == rangeCount) {
+                pending = INT64_MAX;
+            } else {
+                carry = true;
+                carried = std::move(stack);
+            }
         }
     }
-    const bool stopped = !converged && !scanner.error() && scanner.atEnd() && row < count &&
-                         d.rows.start(row, n) < n;
-    d.stats.rowsScanned = row - first + (stopped ? 1 : 0);
-    if (!converged && !scanner.error()) scanner.finish();
-    const size_t endRow = converged ? row : count;
-    const size_t baseEnd = converged ? static_cast<size_t>(static_cast<long>(row) - g.lineDelta) : g.baselineRows;
-    out.regionFirstLine = first + 1;
-    out.regionOldLines = baseEnd - first;
-    out.regionNewLines = endRow - first;
-    if (scanner.error()) {
-        setUnreadable(d, scanError(d, scanner, base));
-        return;
-    }
 
-    if (converged) {
-        const bool sameRows = g.lineDelta == 0 && g.rowsDropped == 0;
-        bool sameColumns = sameRows;
-        int64_t least = INT64_MAX;
-        int64_t leastOld = g.droppedMinColumn;
-        for (size_t r = first; r < row; ++r) {
-            const int16_t mine = columns[r - first];
-            const int16_t old = d.rows.column(r);
-            sameColumns = sameColumns && mine == old;
-            if (mine >= 0) least = std::min<int64_t>(least, mine);
-            if (old >= 0) leastOld = std::min<int64_t>(leastOld, old);
-        }
-        const int64_t limit = std::min(least, leastOld);
-        if (!sameColumns && limit != INT64_MAX && !checkRowsBelow(d, scanner.indents(), row, limit)) return;
-    }
-
-    // The text reads: make the new logicals before anything changes.
-    p = static_cast<const Char*>(d.text.contiguousFrom(base));
-    py::Ref fresh = makeLogicals(scanner, p, d);
+    // The text reads. Each group's old logicals, in the baseline's line
+    // numbers, found before anything moves.
     PyObject* list = d.list.get();
-    const Py_ssize_t i0 = lowerBound(list, static_cast<int64_t>(first) + 1);
-    const Py_ssize_t i1 = converged ? lowerBound(list, static_cast<int64_t>(baseEnd) + 1) : PyList_GET_SIZE(list);
-    const Py_ssize_t m = PyList_GET_SIZE(fresh.get());
-    Py_ssize_t head = 0;
-    while (head < m && i0 + head < i1) {
-        PyObject* a = PyList_GET_ITEM(list, i0 + head);
-        PyObject* b = PyList_GET_ITEM(fresh.get(), head);
-        if (record(a)->fLineno != record(b)->fLineno || !sameSignature(a, b)) break;
-        ++head;
+    long delta = 0;
+    Py_ssize_t from = 0;
+    for (GroupRead& G : groups) {
+        G.i0 = lowerBound(list, from, static_cast<int64_t>(G.first) - delta + 1);
+        G.i1 = G.converged ? lowerBound(list, G.i0, static_cast<int64_t>(G.end) - delta - G.lineDelta + 1)
+                           : PyList_GET_SIZE(list);
+        requireInOrder(list, G.i0, G.i1);
+        from = G.i1;
+        delta += G.lineDelta;
     }
-    Py_ssize_t tail = 0;
-    while (tail < m - head && tail < i1 - i0 - head &&
-           sameSignature(PyList_GET_ITEM(list, i1 - 1 - tail), PyList_GET_ITEM(fresh.get(), m - 1 - tail))) {
-        ++tail;
+    region(groups);
+
+    out.added = py::check(PyList_New(0));
+    out.removed = py::check(PyList_New(0));
+    delta = 0;
+    Py_ssize_t offset = 0;   // how far the splices above moved the list's items
+    Py_ssize_t current = 0;  // items before this carry current line numbers
+    for (GroupRead& G : groups) {
+        PyObject* fresh = G.fresh.get();
+        const Py_ssize_t a0 = G.i0 + offset;
+        const Py_ssize_t a1 = G.i1 + offset;
+        const Py_ssize_t m = PyList_GET_SIZE(fresh);
+        Py_ssize_t head = 0;
+        while (head < m && a0 + head < a1) {
+            PyObject* a = PyList_GET_ITEM(list, a0 + head);
+            PyObject* b = PyList_GET_ITEM(fresh, head);
+            if (record(a)->fLineno + delta != record(b)->fLineno || !sameSignature(a, b)) break;
+            ++head;
+        }
+        Py_ssize_t tail = 0;
+        while (tail < m - head && tail < a1 - a0 - head &&
+               sameSignature(PyList_GET_ITEM(list, a1 - 1 - tail), PyList_GET_ITEM(fresh, m - 1 - tail))) {
+            ++tail;
+        }
+        shiftLines(list, current, a0 + head, delta);
+        for (Py_ssize_t k = 1; k <= tail; ++k) {
+            record(PyList_GET_ITEM(list, a1 - k))->fLineno = record(PyList_GET_ITEM(fresh, m - k))->fLineno;
+        }
+        py::Ref removed = py::check(PyList_GetSlice(list, a0 + head, a1 - tail));
+        shiftLines(removed.get(), 0, PyList_GET_SIZE(removed.get()), delta);
+        py::Ref added = py::check(PyList_GetSlice(fresh, head, m - tail));
+        py::checkStatus(PyList_SetSlice(list, a0 + head, a1 - tail, added.get()));
+        py::checkStatus(PyList_SetSlice(out.removed.get(), PY_SSIZE_T_MAX, PY_SSIZE_T_MAX, removed.get()));
+        py::checkStatus(PyList_SetSlice(out.added.get(), PY_SSIZE_T_MAX, PY_SSIZE_T_MAX, added.get()));
+        current = a0 + m;
+        offset += m - (a1 - a0);
+        delta += G.lineDelta;
     }
-    out.removed = py::check(PyList_GetSlice(list, i0 + head, i1 - tail));
-    out.added = py::check(PyList_GetSlice(fresh.get(), head, m - tail));
-    for (Py_ssize_t k = 1; k <= tail; ++k) {
-        record(PyList_GET_ITEM(list, i1 - k))->fLineno = record(PyList_GET_ITEM(fresh.get(), m - k))->fLineno;
-    }
-    py::checkStatus(PyList_SetSlice(list, i0 + head, i1 - tail, out.added.get()));
-    const Py_ssize_t below = i1 + (m - (i1 - i0));
-    shiftBelow(list, below, g.lineDelta);
+    shiftLines(list, current, PyList_GET_SIZE(list), delta);
     d.stats.logicalsRemoved = static_cast<size_t>(PyList_GET_SIZE(out.removed.get()));
-    d.stats.logicalsShifted = static_cast<size_t>(PyList_GET_SIZE(list) - below);
+    d.stats.logicalsShifted = static_cast<size_t>(PyList_GET_SIZE(list) - current);
 
     // The rows read take their new states and columns.
-    for (size_t r = first; r < endRow && r - first < columns.size(); ++r) d.rows.column(r) = columns[r - first];
-    for (size_t r = first + 1; r < endRow && r - first - 1 < states.size(); ++r) {
-        d.rows.state(r) = states[r - first - 1];
+    for (const GroupRead& G : groups) {
+        // A row the scanner never reached (the empty one after a last '\n')
+        // runs no check.
+        for (size_t r = G.first; r < G.end; ++r) {
+            d.rows.column(r) = r - G.first < G.columns.size() ? G.columns[r - G.first] : kNoIndentCheck;
+        }
+        for (size_t r = G.first + 1; r < G.end && r - G.first - 1 < G.states.size(); ++r) {
+            d.rows.state(r) = G.states[r - G.first - 1];
+        }
+        if (G.stopped) d.rows.column(G.end - 1) = kNoIndentCheck;
     }
-    if (stopped) d.rows.column(row) = kNoIndentCheck;
     d.stackCache.valid = true;
-    d.stackCache.row = first;
-    d.stackCache.stack = std::move(stack);
+    d.stackCache.row = groups.front().first;
+    d.stackCache.stack = std::move(groups.front().stack);
     d.readable = true;
     d.error.reset();
     d.damage = Damage();
@@ -387,10 +529,74 @@ std::string checkRowsAs(Document& d) {
         ++row;
         if (row < count && d.rows.state(row) != pack(scanner.state())) return describe("entry state", row);
     }
+    for (; row < count; ++row) {
+        if (d.rows.column(row) != kNoIndentCheck) return describe("indentation column", row);
+    }
     return std::string();
 }
 
+// The rows outside the damage against a whole scan of the last text that
+// read: they must hold its states and columns, shifted by the rows the
+// damage above them added.
+template <class Char>
+std::string checkBaselineRowsAs(Document& d, const Char* text, size_t length) {
+    const size_t bom = compat::kPython3 ? (length >= 1 && text[0] == 0xFEFF ? 1 : 0)
+                                        : (length >= 3 && text[0] == 0xEF && text[1] == 0xBB && text[2] == 0xBF ? 3 : 0);
+    Scanner<Char> scanner(text + bom, length - bom);
+    std::vector<RowState> states{pack(scanner.state())};
+    std::vector<int16_t> columns;
+    while (scanner.scanRow()) {
+        columns.push_back(columnOf(scanner.rowIndentColumn()));
+        states.push_back(pack(scanner.state()));
+    }
+    const size_t baselineRows = d.damage.baselineRows;
+    columns.resize(baselineRows, kNoIndentCheck);
+    states.resize(baselineRows, RowState());
+    const size_t count = d.rows.count();
+    long delta = 0;
+    size_t r = 0;
+    auto compare = [&](size_t until, bool stateToo) -> std::string {
+        for (; r < until && r < count; ++r) {
+            const long b = static_cast<long>(r) - delta;
+            if (b < 0 || static_cast<size_t>(b) >= baselineRows) return "row " + std::to_string(r + 1) + " has no row in the last text that read";
+            if (stateToo && d.rows.state(r) != states[b]) {
+                return "row " + std::to_string(r + 1) + ": its entry state is not the last readable text's";
+            }
+            if (d.rows.column(r) != columns[b]) {
+                return "row " + std::to_string(r + 1) + ": its indentation column is not the last readable text's";
+            }
+            stateToo = true;
+        }
+        return std::string();
+    };
+    for (const DamageRange& range : d.damage.ranges) {
+        const size_t startRow = rowOfOffset(d, range.start) - 1;
+        const size_t afterRow = rowOfOffset(d, range.end);
+        std::string problem = compare(startRow, true);
+        if (!problem.empty()) return problem;
+        // The first damaged row starts as it did; what it holds has changed.
+        if (r == startRow && r < count && d.rows.state(r) != states[static_cast<size_t>(static_cast<long>(r) - delta)]) {
+            return "row " + std::to_string(r + 1) + ": its entry state is not the last readable text's";
+        }
+        r = std::max(r, afterRow);
+        delta += range.lineDelta;
+    }
+    return compare(count, true);
+}
+
 }  // namespace
+
+std::string checkBaselineRows(Document& d, PyObject* baseline) {
+    compat::TextChars chars;
+    if (!compat::textChars(baseline, &chars)) py::fail();
+    const size_t n = static_cast<size_t>(chars.length);
+    switch (chars.kind) {
+    case 1: return checkBaselineRowsAs(d, static_cast<const uint8_t*>(chars.data), n);
+    case 2: if constexpr (compat::kPython3) return checkBaselineRowsAs(d, static_cast<const uint16_t*>(chars.data), n); break;
+    default: if constexpr (compat::kPython3) return checkBaselineRowsAs(d, static_cast<const uint32_t*>(chars.data), n); break;
+    }
+    return "a 2.7 text holds bytes only";
+}
 
 std::string checkRowStates(Document& d) {
     switch (d.text.width()) {

@@ -55,7 +55,8 @@ py::Ref call(const char* function, PyObject* a, PyObject* b, PyObject* c) {
 void selfCheck(Document& d) {
     std::string problems;
     checkRows(d, problems);
-    PyObject* text = wholeText(d);
+    py::Ref held = py::Ref::own(wholeText(d));
+    PyObject* text = held.get();
     py::Ref logicals = logicalsCopy(d);
     if (d.readable) {
         const std::string rows = checkRowStates(d);
@@ -65,6 +66,18 @@ void selfCheck(Document& d) {
     } else {
         PyObject* error = d.error ? d.error.get() : Py_None;
         collect(call("CompareError", text, d.filename.get(), error).get(), problems);
+        // The logicals and names kept are those of the last text that read.
+        py::Ref baseline = baselineText(d);
+        std::string kept;
+        collect(call("CompareLogicals", baseline.get(), d.filename.get(), logicals.get()).get(), kept);
+        if (!kept.empty()) problems += "\n  the logicals kept differ from the last text that read:" + kept;
+        const std::string states = checkBaselineRows(d, baseline.get());
+        if (!states.empty()) addProblem(problems, states);
+        const long rows = static_cast<long>(d.rows.count()) - d.damage.lineDelta();
+        if (rows != static_cast<long>(d.damage.baselineRows)) {
+            addProblem(problems, "the last text that read had " + std::to_string(d.damage.baselineRows) +
+                                     " lines, the damage makes it " + std::to_string(rows));
+        }
     }
     if (problems.empty()) return;
     std::string message = "the document differs from a fresh read of its text:" + problems;
