@@ -27,9 +27,11 @@ Pipelines, side by side in one run:
                (process CPU time per call, median over batches with the
                10th-90th percentile spread); open and close each timed;
   whole text   CReferenceDocument (tools/dockit/reference.py): the whole
-               text read again with ReadLogicals, the list kept by common
-               prefix and suffix, one FindChanges, as callers do today;
-               fewer places at 100k (about a second per edit);
+               text read again with ReadLogicals' reader written in Python,
+               the list kept by common prefix and suffix, one FindChanges,
+               as callers do today; fewer places at 100k (about a second
+               per edit); and the same with ReadLogicals' native reader
+               (pysource._reader) where it is built;
   parso        parso's diff parser (parse with diff_cache) under the
                system's /usr/bin/python3, in a child process, on the same
                text and edits; skipped where parso is missing.
@@ -38,7 +40,8 @@ Then creating a document (per line) and the memory a document keeps beyond
 its logicals, in bytes per line: the RSS a child process gains by making
 the document, less the RSS another child gains by reading the same text
 into named logicals (freed memory handed back with malloc_trim before each
-reading). The text the document keeps is shown apart. Targets are printed
+reading; copies of the smaller files held at once, ~100k lines in all).
+The text the document keeps is shown apart. Targets are printed
 beside the figures.
 """
 
@@ -57,7 +60,7 @@ import benchkit
 from benchkit import CChangeFinder, Clock, FormatSpread, ReadLogicals, Spread
 
 import toolpath
-from dockit.reference import CReferenceDocument
+from dockit.reference import CNativeReadDocument, CReferenceDocument, ReferenceRead
 
 try:
     from pysource.scopedocument import CScopeDocument
@@ -334,16 +337,19 @@ with open(%(text)r, 'rb') as f:
 if sys.version_info[0] > 2:
     text = text.decode('utf-8')
 kind = %(kind)r
-before = Rss()
-if kind == 'logicals':
-    held = ReadLogicals(text)
-    CChangeFinder(held).FindChanges(held, [])
-elif kind == 'document':
-    from pysource.scopedocument import CScopeDocument
-    held = CScopeDocument(text)
+if kind == 'document':
+    from pysource.scopedocument import CScopeDocument as Make
+elif kind == 'reference':
+    from dockit.reference import CReferenceDocument as Make
 else:
-    from dockit.reference import CReferenceDocument
-    held = CReferenceDocument(text)
+    def Make(text):
+        lst = ReadLogicals(text)
+        finder = CChangeFinder(lst)
+        finder.FindChanges(lst, [])
+        return (lst, finder) if kind == 'finder' else lst
+Make(text)
+before = Rss()
+held = [Make(text) for _ in range(%(copies)d)]
 print(Rss() - before)
 '''
 
@@ -357,6 +363,8 @@ def CharWidth(text):
 
 
 def MemoryPerLine(text, kinds):
+    # Many copies of a small file, so that the pools' slack is small beside them.
+    copies = max(1, 100000 // (text.count('\n') + 1))
     handle, text_path = tempfile.mkstemp(suffix='.py')
     with os.fdopen(handle, 'wb') as f:
         f.write(text if kPy2 else text.encode('utf-8'))
@@ -364,10 +372,10 @@ def MemoryPerLine(text, kinds):
     try:
         for kind in kinds:
             code = kMemoryChild % dict(path=[os.path.join(toolpath.kRepoDir, 'tools')] + sys.path,
-                                       text=text_path, kind=kind)
+                                       text=text_path, kind=kind, copies=copies)
             proc = subprocess.Popen([sys.executable, '-c', code], stdout=subprocess.PIPE)
             out = proc.communicate()[0]
-            grown[kind] = int(out.split()[-1]) if proc.returncode == 0 else None
+            grown[kind] = int(out.split()[-1]) / float(copies) if proc.returncode == 0 else None
     finally:
         os.remove(text_path)
     return grown
@@ -425,7 +433,9 @@ def main(argv=None):
     rng = random.Random(1)
     files = Files(sizes)
     line_counts = dict((s, t.count('\n') + 1) for s, _, t in files)
-    native, reference, parso, memory = {}, {}, {}, {}
+    native, reference, native_read, parso, memory = {}, {}, {}, {}, {}
+    # ReadLogicals reads natively by default where it has a reference reader beside.
+    has_native_reader = ReferenceRead is not ReadLogicals
     for size, name, text in files:
         sys.stderr.write('%s: %s, %d lines\n' % (size, name, line_counts[size]))
         places = Places(text)
@@ -440,10 +450,12 @@ def main(argv=None):
         streams['close """'] = []
         if args.reference:
             reference[size] = BenchDocument(CReferenceDocument, text, streams, 1, True)
+            if has_native_reader:
+                native_read[size] = BenchDocument(CNativeReadDocument, text, streams, 1, True)
         if args.parso:
             parso[size] = BenchParso(text, streams)
         if args.memory:
-            memory[size] = MemoryPerLine(text, ['logicals', 'reference'] +
+            memory[size] = MemoryPerLine(text, ['logicals', 'finder', 'reference'] +
                                          (['document'] if CScopeDocument is not None else []))
 
     print('Edits through a document, process CPU time per call, median [10th-90th percentile]')
@@ -456,8 +468,11 @@ def main(argv=None):
     else:
         print('\nCScopeDocument: pysource.scopedocument is not built')
     if args.reference:
-        PrintTable('Whole text read again (CReferenceDocument), each call timed:', 'ms', sizes,
-                   reference, line_counts, False)
+        PrintTable('Whole text read again by the reader in Python (CReferenceDocument), each '
+                   'call timed:', 'ms', sizes, reference, line_counts, False)
+        if has_native_reader:
+            PrintTable('Whole text read again by the native reader (the same pipeline), each call '
+                       'timed:', 'ms', sizes, native_read, line_counts, False)
     if args.parso:
         if all(isinstance(v, dict) for v in parso.values()):
             version = list(parso.values())[0].get('version', '?')
@@ -468,13 +483,15 @@ def main(argv=None):
             print('\nparso: ' + '; '.join('%s: %s' % (s, v) for s, v in sorted(parso.items())
                                           if not isinstance(v, dict)))
     if args.memory:
-        print('\nMemory beyond the named logicals, bytes per line (RSS a child gains, less the '
-              'RSS a child gains holding the logicals alone; target %s):' % kTargets['memory', None])
+        print('\nMemory beyond the named logicals, bytes per line (RSS a child gains holding ~100k '
+              'lines of documents, less the RSS a child gains holding their logicals alone; target '
+              '%s):' % kTargets['memory', None])
         for size, _, text in files:
             grown = memory[size]
             lines = float(line_counts[size])
             width = CharWidth(text)
-            parts = ['logicals alone %.0f' % (grown['logicals'] / lines)]
+            parts = ['logicals alone %.0f' % (grown['logicals'] / lines),
+                     'a finder kept beside them %.1f' % ((grown['finder'] - grown['logicals']) / lines)]
             for kind in ('document', 'reference'):
                 if grown.get(kind) is not None:
                     beyond = (grown[kind] - grown['logicals']) / lines

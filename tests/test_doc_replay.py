@@ -128,6 +128,9 @@ class TextEditsTest(unittest.TestCase):
         op = Op('EditMany', [(1, 1, 1, 1, 'x'), (1, len(line) + 1, 1, len(line) + 1, 'y')],
                 utf16=True)
         self.assertEqual(op.Args(line), ([(1, 1, 1, 1, 'x'), (1, 7, 1, 7, 'y')],))
+        # On 2.7 a column inside a character's bytes has no UTF-16 column.
+        self.assertEqual(Op('Edit', [(1, 2, 1, 3, '')]).Utf16Possible(line), PY3)
+        self.assertTrue(Op('Edit', [(1, 1, 1, 1, 'x')]).Utf16Possible(line))
 
     def testDroppedLinesMoveTheRangesBelowThem(self):
         ops = [Op('Edit', [(3, 0, 4, 2, 'a\nb\nc')]), Op('EditMany', [(2, 0, 2, 0, 'z'),

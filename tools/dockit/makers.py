@@ -129,7 +129,7 @@ class TextEditMaker(object):
         line = lines[i]
         if not line:
             return None
-        col = self._Col(line[:-1])
+        col = CharStart(line, self.rng.randrange(len(line)))
         end = col + 1
         if kPy2:
             while end < len(line) and (ord(line[end]) & 0xC0) == 0x80:

@@ -103,10 +103,13 @@ class Op(object):
         return text
 
     def Utf16Possible(self, text):
+        """Whether every column can be given in UTF-16 units: on 2.7 its line
+        is UTF-8 and the column at a character's start."""
         for r in self.ranges:
             lines = text.split('\n')
-            if not (Utf16Ready(lines[r[0] - 1]) and Utf16Ready(lines[r[2] - 1])):
-                return False
+            for line, col in ((lines[r[0] - 1], r[1]), (lines[r[2] - 1], r[3])):
+                if not Utf16Ready(line) or CharStart(line, col) != col:
+                    return False
             text = ApplyRange(text, r)
         return True
 
