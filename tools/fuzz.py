@@ -75,7 +75,8 @@ def _ParseArgs(argv):
     p.add_argument('--jobs', type=int, default=1, help='child processes at once')
     p.add_argument('--episode', type=int, help='replay this one episode and print its log')
     p.add_argument('--leak-probe', action='store_true', help='with --episode: its leak probe')
-    p.add_argument('--profile', choices=['edits', 'badargs', 'hostile', 'pickles', 'mixed'])
+    p.add_argument('--profile', choices=['edits', 'badargs', 'hostile', 'pickles', 'mixed',
+                                         'documents'])
     p.add_argument('--steps', type=int, help='actions per episode (default 8-40)')
     p.add_argument('--episode-timeout', type=float,
                    help='seconds one episode may take (default 20, 120 sanitized)')

@@ -12,6 +12,12 @@ from fuzzkit.calls import Finding, Short
 
 kRecursion = 'FindChanges cannot be called recursively'
 kProfiles = (('edits', 3), ('badargs', 3), ('hostile', 4), ('pickles', 2), ('mixed', 2))
+try:
+    from fuzzkit import documents
+    if documents.Available():
+        kProfiles += (('documents', 3),)
+except ImportError:  # the text-edit replay's tools are not beside this one
+    documents = None
 # Shapes of the faults already known; --known keeps the generator away from them.
 kKnownShapes = {
     'foreign-added-O': 'under -O an added logical not in the list renames the last logical',
@@ -348,6 +354,8 @@ def RunEpisode(seed, index, recorder, known, optimized, steps=None, profile=None
     recorder.Begin('episode %d of seed %s (profile %s)' % (index, seed, ctx.profile))
     saved_interval = hostile.GetSwitchInterval()
     try:
+        if ctx.profile == 'documents':
+            return documents.Run(ctx, steps or ctx.rng.randint(8, 40))
         ctx.Start()
         for n in range(steps or ctx.rng.randint(8, 40)):
             action = 'Plant' if plant and n == 1 else ctx.Pick(actions.kTables[ctx.profile])
