@@ -226,6 +226,9 @@ void requireRunPlaced(Py_ssize_t end, Py_ssize_t at);
 // being passed as added can cause. AssertionError where the steps assert;
 // optimised, naming on would store None, so it is a RuntimeError.
 void requireScopeFound(PyObject* scope, Py_ssize_t i);
+// Whether `name` is the scope `prefix` or one nested in it (the prefix ends
+// at a separator). A name that is not a str is asked through Python.
+bool inScope(PyObject* name, PyObject* prefix);
 // A scope name about to be stored or used: str or None, else TypeError.
 void requireStrOrNone(PyObject* name);
 // `a, b = seq` (exactly two items) or, with firstTwo, `a, b = seq[:2]`.

@@ -32,11 +32,52 @@ bool standsAt(PyObject* self, PyObject* logical, Py_ssize_t index) {
     return false;
 }
 
+// A removed class/def is mapped to the first logical at or after its line
+// number. Lines that belonged to no logical (blank lines after a stray
+// closing bracket) taken out in the same change leave its old body numbered
+// below that: the body then stands just before the index its own number
+// gives, or just before the one the first removed logical of its change
+// mapped to (`runStart`). The logicals there still named inside its scope
+// stood after it; the first of them is where the visit must start (-1 when
+// there is none).
+Py_ssize_t oldBodyStart(PyObject* self, const LogicalRef& removed, Py_ssize_t index, Py_ssize_t runStart) {
+    if (!isScopeStart(removed.record())) return -1;
+    PyObject* list = finderState(self).logicalList;
+    auto namedInside = [&](Py_ssize_t k, PyObject* full) {
+        // Read afresh: a name compared through Python may change the list.
+        if (k < 0 || k >= PyList_GET_SIZE(list)) return false;
+        PyObject* at = PyList_GET_ITEM(list, k);
+        if (!logicalCheck(at)) return false;
+        LogicalRef item = LogicalRef::own(at);
+        py::Ref name = py::Ref::own(scopeName(item.record()));
+        return !name.isNone() && inScope(name.get(), full);
+    };
+    py::Ref full;
+    Py_ssize_t first = -1;
+    for (Py_ssize_t start : {index, runStart}) {
+        if (start <= 0 || (first >= 0 && start > first)) continue;
+        if (!full) {
+            py::Ref local = py::Ref::own(localScopeDefined(removed.record()));
+            py::Ref scope = py::Ref::own(scopeName(removed.record()));
+            if (!local || scope.isNone()) return -1;
+            full = joinTwoScopeNames(scope.get(), local.get());
+        }
+        Py_ssize_t k = start;
+        while (k > 0 && namedInside(k - 1, full.get())) --k;
+        if (k < start) first = k;
+    }
+    return first;
+}
+
 }  // namespace
 
 void processRemoved(PyObject* self, PyObject* removedList, IndexList& result) {
     const bool native = nativePass(self);
     Py_ssize_t lastIndex = -1;
+    // One change's removed logicals come in line order: a number not above
+    // the last one's starts another change.
+    Py_ssize_t runStart = -1;
+    long runLine = 0;
     for (Py_ssize_t k = 0; k < PyList_GET_SIZE(removedList); ++k) {
         LogicalRef logical = LogicalRef::own(PyList_GET_ITEM(removedList, k));
         py::Ref scope = py::Ref::own(scopeName(logical.record()));
@@ -49,16 +90,25 @@ void processRemoved(PyObject* self, PyObject* removedList, IndexList& result) {
         if (native && isScopeStart(logical.record()) && !standsAt(self, logical.get(), index)) {
             unfileDefinition(self, logical.get());
         }
+        Py_ssize_t n = logicalListLength(self);
+        const Py_ssize_t at = std::min(std::max<Py_ssize_t>(index, 0), n);
+        if (runStart < 0 || logical->fLineno <= runLine) runStart = at;
+        runStart = std::min(runStart, at);
+        runLine = logical->fLineno;
+        const Py_ssize_t body = oldBodyStart(self, logical, at, runStart);
+        n = logicalListLength(self);
+        if (body >= 0 && body < n && body != lastIndex) {
+            result.append(body);
+            lastIndex = body;
+        }
         // A logical removed from the end of the list still moves the comment
         // and blank lines before it (they took their scope from it): the last
         // logical stands in its place.
-        const Py_ssize_t n = logicalListLength(self);
         if (index >= n && n > 0) index = n - 1;
         if (index != lastIndex && index >= 0 && index < n) result.append(index);
         lastIndex = index;
     }
 }
-
 void LogicalInScopeChanged(PyObject* self, PyObject* logicalObj, PyObject* scopeName,
                            PyObject* oldContainingScope, PyObject* oldLeafScope) {
     FinderState& s = finderState(self);

@@ -1,0 +1,52 @@
+"""Faults of reloads, shared lists, failed calls and stray brackets: each
+case runs with assertions on and under -O (ctest runs the suite both ways),
+and where a path is named, on the native path and through the overrides."""
+import sys
+import unittest
+
+from support import Edit, Names, Read, WholeListNames
+from pysource.scopebodycache import CChangeFinder
+
+OPTIMISED = bool(sys.flags.optimize)
+
+
+class Routed(CChangeFinder):
+    """Takes every step through the overrides' route."""
+
+    def _Clear(self):
+        CChangeFinder._Clear(self)
+
+
+kPaths = (CChangeFinder, Routed)
+
+
+def Named(source, finder_class=CChangeFinder):
+    lst = Read(source)
+    finder = finder_class(lst)
+    finder.FindChanges(lst, [])
+    return lst, finder
+
+
+class StrayBrackets(unittest.TestCase):
+
+    def testHeaderTakenOutWithLinesOfNoLogical(self):
+        # After `x = a]` the blank line reads as no logical. Taking it out
+        # with the header under it leaves the old body numbered below the
+        # header's number; the body must still lose the removed scope. The
+        # second text takes the header out after a line of another kind and
+        # leaves a module-level line between the body and the header's number.
+        cases = [
+            ('class K:\n    x = a]\n\n    def f(self):\n        y = 2\n    z = [\n',
+             'class K:\n    x = a]\n        y = 2\n    z = [\n'),
+            (')\n  w = 1\n\n        y = 2\nclass K:\n    def f(self):\nx = (\n',
+             ')\n  w = 1\n    def f(self):\nx = (\n'),
+        ]
+        for old, new in cases:
+            for path in kPaths:
+                lst, finder = Named(old, path)
+                finder.FindChanges(*Edit(lst, new))
+                self.assertEqual(Names(lst), WholeListNames(new), (path.__name__, new))
+
+
+if __name__ == '__main__':
+    unittest.main()
