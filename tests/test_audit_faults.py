@@ -48,5 +48,24 @@ class StrayBrackets(unittest.TestCase):
                 self.assertEqual(Names(lst), WholeListNames(new), (path.__name__, new))
 
 
+class FailedCalls(unittest.TestCase):
+
+    def testBadAddedItemAfterGoodOnesChangesNoLogical(self):
+        # The good items carry names (an undo puts back named objects); the
+        # call fails on the bad one and must leave them named, so the next
+        # call that keeps to the protocol works.
+        source = 'class A:\n    def f(self):\n        x = 1\n    y = 2\n'
+        for path in kPaths:
+            for bad in (None, 3, 'x'):
+                lst, finder = Named(source, path)
+                before = Names(lst)
+                self.assertRaises(TypeError, finder.FindChanges, [lst[1], lst[2], bad], [])
+                self.assertEqual(Names(lst), before, (path.__name__, bad))
+                self.assertEqual(finder.FindChanges([], []), (set(), set(), set()))
+                new = source.replace('x = 1', 'x = 2')
+                finder.FindChanges(*Edit(lst, new))
+                self.assertEqual(Names(lst), WholeListNames(new))
+
+
 if __name__ == '__main__':
     unittest.main()
