@@ -4,8 +4,9 @@ and where a path is named, on the native path and through the overrides."""
 import sys
 import unittest
 
-from support import Edit, Names, Read, WholeListNames
-from pysource.scopebodycache import CChangeFinder
+import pysource.symbolinfo as symbolinfo
+from support import PY3, Edit, Names, Read, WholeListNames
+from pysource.scopebodycache import CChangeFinder, GetInfoBytesKind, IsDefKind
 
 OPTIMISED = bool(sys.flags.optimize)
 
@@ -65,6 +66,23 @@ class FailedCalls(unittest.TestCase):
                 new = source.replace('x = 1', 'x = 2')
                 finder.FindChanges(*Edit(lst, new))
                 self.assertEqual(Names(lst), WholeListNames(new))
+
+
+class Characters(unittest.TestCase):
+
+    def testKindCharacterAboveOneByteIsNoKind(self):
+        # U+0146 ends in the byte of 'F' (the function kind), U+013A in that
+        # of ':'. On 2.7 the text is its UTF-8 bytes, read byte by byte.
+        plain = symbolinfo.kPlainEquivKind
+        for text in (u':\u0146', u':\u0146name', u'\u013ax', u'\u013a\u0146', u'\u013a:F'):
+            ibytes = text if PY3 else text.encode('utf-8')
+            kind = GetInfoBytesKind(ibytes)
+            self.assertFalse(IsDefKind(kind), repr(text))
+            self.assertNotEqual(kind, symbolinfo.kFunctionKind, repr(text))
+            if PY3 or not text.startswith(u':'):
+                self.assertEqual(kind, plain, repr(text))
+        # A character of the one-byte range is its byte, as 2.7 reads it.
+        self.assertEqual(GetInfoBytesKind(u':\xe9' if PY3 else ':\xe9'), -23)
 
 
 if __name__ == '__main__':

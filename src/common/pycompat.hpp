@@ -9,6 +9,8 @@
 #pragma once
 
 #include <Python.h>
+
+#include <cstdint>
 #include <frameobject.h>
 
 #include <cstdarg>
@@ -112,7 +114,8 @@ inline const char* otherTextBytes(PyObject* o, py::Ref* holder) {
 }
 
 // The length of a str in characters (bytes on 2.7), and the character at
-// `i` (< length) as a C char: its low 8 bits on 3.x.
+// `i` (< length) as a code point (a byte's value, 0-255, on 2.7): a
+// character above U+00FF is never narrowed to a byte.
 inline Py_ssize_t strLength(PyObject* s) {
 #if PY_MAJOR_VERSION >= 3
     return py::checkSize(PyUnicode_GetLength(s));
@@ -121,13 +124,13 @@ inline Py_ssize_t strLength(PyObject* s) {
 #endif
 }
 
-inline char strCharAt(PyObject* s, Py_ssize_t i) {
+inline uint32_t strCharAt(PyObject* s, Py_ssize_t i) {
 #if PY_MAJOR_VERSION >= 3
     const Py_UCS4 c = PyUnicode_ReadChar(s, i);
     if (c == static_cast<Py_UCS4>(-1) && PyErr_Occurred()) py::fail();
-    return static_cast<char>(c & 0xFF);
+    return c;
 #else
-    return PyString_AS_STRING(s)[i];
+    return static_cast<unsigned char>(PyString_AS_STRING(s)[i]);
 #endif
 }
 

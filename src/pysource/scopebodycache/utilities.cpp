@@ -28,10 +28,14 @@ char getInfoBytesKind(PyObject* ibytes) noexcept {
     return neverRaises("pysource.symbolinfo.GetInfoBytesKind", char(0), [ibytes] {
         if (ibytes == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
         // By characters: a kind read from a 2.7 pickle (latin-1) is the same.
+        // A kind is one byte: a character above U+00FF is none, and the
+        // string reads as plain, never as the kind of its low byte.
         if (compat::strLength(ibytes) < 2 || compat::strCharAt(ibytes, 0) != ':') {
             return gSymbolInfo.kPlainEquivKind;
         }
-        return compat::strCharAt(ibytes, 1);
+        const uint32_t kind = compat::strCharAt(ibytes, 1);
+        if (kind > 0xFF) return gSymbolInfo.kPlainEquivKind;
+        return static_cast<char>(kind);
     });
 }
 
