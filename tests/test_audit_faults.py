@@ -1,6 +1,8 @@
 """Faults of reloads, shared lists, failed calls and stray brackets: each
 case runs with assertions on and under -O (ctest runs the suite both ways),
 and where a path is named, on the native path and through the overrides."""
+import copy
+import pickle
 import sys
 import unittest
 
@@ -83,6 +85,40 @@ class Characters(unittest.TestCase):
                 self.assertEqual(kind, plain, repr(text))
         # A character of the one-byte range is its byte, as 2.7 reads it.
         self.assertEqual(GetInfoBytesKind(u':\xe9' if PY3 else ':\xe9'), -23)
+
+
+class Taking(CChangeFinder):
+    """Pickles and copies itself from inside FindChanges."""
+    takers = [('pickle', lambda f: pickle.loads(pickle.dumps(f, 2))), ('copy', copy.copy),
+              ('deepcopy', copy.deepcopy)]
+    taken = []
+
+    def _ProcessAddedLogicals(self, added, indices):
+        CChangeFinder._ProcessAddedLogicals(self, added, indices)
+        self.taken.extend((label, take(self)) for label, take in self.takers)
+
+
+class Copies(unittest.TestCase):
+
+    def testFinderTakenDuringACallLoadsIdle(self):
+        # Pickled and copied from inside an override while the call runs:
+        # each loaded finder's next call works and names the list as a
+        # fresh pass does, and the call it was taken from ends as usual.
+        source = 'class A:\n    def f(self):\n        x = 1\n'
+        del Taking.taken[:]
+        lst, finder = Named(source, Taking)
+        new = source.replace('x = 1', 'x = 2')
+        self.assertEqual(finder.FindChanges(*Edit(lst, new))[0], set(['A#0.f#0']))
+        taken_all, Taking.takers = list(Taking.taken), []
+        self.assertEqual(len(taken_all), 3)
+        for label, taken in taken_all:
+            self.assertEqual(taken.FindChanges([], []), (set(), set(), set()), label)
+            other = source.replace('x = 1', 'x = 3')
+            mine = taken._fLogicalList
+            taken.FindChanges(*Edit(mine, other))
+            self.assertEqual(Names(mine), WholeListNames(other), label)
+            if mine is lst:
+                finder.FindChanges(*Edit(lst, new))
 
 
 if __name__ == '__main__':

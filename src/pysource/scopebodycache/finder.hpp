@@ -97,6 +97,9 @@ struct FinderState {
     long owedScanIndent;
     // - the native pass of the call in progress (null otherwise);
     NativePass* native;
+    // - whether a FindChanges of this very finder is running, on either
+    //   path (a state applied to it then is its own business);
+    bool inCall;
     // - the definition index, kept between calls while it matches the list;
     DefIndex* defIndex;
     // - the tuple the last native call returned, with its three sets, while
