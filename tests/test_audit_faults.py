@@ -51,6 +51,38 @@ class StrayBrackets(unittest.TestCase):
                 self.assertEqual(Names(lst), WholeListNames(new), (path.__name__, new))
 
 
+class SharedLists(unittest.TestCase):
+    kSource = 'class A:\n    def f(self):\n        pass\n    def g(self):\n        pass\n'
+    kSteps = [kSource.replace('class A:', 'class B:'),
+              kSource.replace('class A:', 'class B:').replace('def g', 'def f')]
+
+    def Run(self, path, tell):
+        """Names after each step, where tell(k, finders, edit) passes step k's
+        edit to one or more of the finders."""
+        lst, first = Named(self.kSource, path)
+        finders = [first, copy.copy(first), path(lst)]
+        seen = []
+        for k, text in enumerate(self.kSteps):
+            tell(k, finders, Edit(lst, text))
+            seen.append(Names(lst))
+        return seen
+
+    def testFindersOverOneListAgreeWithTheRoutedPath(self):
+        fresh = [WholeListNames(text) for text in self.kSteps]
+        tellings = {
+            # two finders told of every edit, in turn
+            'both': lambda k, f, edit: [f[0].FindChanges(*edit), f[2].FindChanges(*edit)],
+            # a copy (sharing the list) told of one edit, the original of the next
+            'copy': lambda k, f, edit: f[1 - k].FindChanges(*edit),
+            # each finder told of a different edit
+            'alternate': lambda k, f, edit: f[2 * (k % 2)].FindChanges(*edit),
+        }
+        for label, tell in sorted(tellings.items()):
+            routed = self.Run(Routed, tell)
+            self.assertEqual(routed, fresh, label)
+            self.assertEqual(self.Run(CChangeFinder, tell), routed, label)
+
+
 class FailedCalls(unittest.TestCase):
 
     def testBadAddedItemAfterGoodOnesChangesNoLogical(self):

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <unordered_map>
 
 namespace sbc {
 
@@ -42,11 +43,48 @@ py::Ref bareNameOf(PyObject* logical, const DefinedName& name) {
     return py::check(compat::strFromBytes(whole.data(), name.bareLength));
 }
 
-DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(64, nullptr) {}
+namespace {
+
+// The stamps of the lists that have an index, by list. An index holds its
+// list, so no other list can take the address while the stamp is in use.
+std::unordered_map<const PyObject*, ListStamp>& stamps() {
+    static auto* map = new std::unordered_map<const PyObject*, ListStamp>();  // never freed: used at exit
+    return *map;
+}
+
+uint64_t gStrayWrites = 0;
+
+}  // namespace
+
+void noteNamesWritten(PyObject* list) noexcept {
+    auto& map = stamps();
+    if (map.empty()) return;
+    auto found = map.find(list);
+    if (found != map.end()) ++found->second.writes;
+}
+
+void noteStrayNamesWritten() noexcept { ++gStrayWrites; }
+
+DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(64, nullptr) {
+    stamp_ = &stamps()[list];  // node-based: the address stays
+    ++stamp_->indexes;
+    seenWrites_ = stamp_->writes;
+    seenStrayWrites_ = gStrayWrites;
+}
 
 DefIndex::~DefIndex() {
     clear();
     flushReleases();
+    if (--stamp_->indexes == 0) stamps().erase(list_.get());
+}
+
+bool DefIndex::current() const noexcept {
+    return stamp_->writes == seenWrites_ && gStrayWrites == seenStrayWrites_;
+}
+
+void DefIndex::noteOwnWrites() noexcept {
+    seenWrites_ = ++stamp_->writes;
+    seenStrayWrites_ = gStrayWrites;
 }
 
 void DefIndex::clear() {

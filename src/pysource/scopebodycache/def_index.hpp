@@ -120,6 +120,23 @@ struct DefinedName {
     }
 };
 
+// Name writes, by logical list. Every finder of a list writes the names of
+// the same logicals, and a definition index mirrors those names only while
+// nothing else writes them: each list that has an index gets a stamp that
+// every writer advances (a FindChanges of any finder of the list, a step
+// called directly), and an index is trusted only while the stamp is the one
+// it last saw. Names written where the list cannot be told (a logical's
+// local name set through the module function) advance every stamp at once.
+struct ListStamp {
+    uint64_t writes = 0;
+    size_t indexes = 0;  // the indexes of the list that hold this stamp
+};
+// Someone is about to write names of `list`'s logicals: every index of the
+// list goes stale. Cheap when no index exists anywhere.
+void noteNamesWritten(PyObject* list) noexcept;
+// Names were written in a logical of a list unknown: every index goes stale.
+void noteStrayNamesWritten() noexcept;
+
 class DefIndex {
 public:
     // A definition whose stored index may no longer be its position.
@@ -169,6 +186,12 @@ public:
     // The list length when the last call ended, for the check at the next.
     Py_ssize_t recordedLength = -1;
 
+    // Whether no one but its finder has written names of the list since it
+    // last looked (see ListStamp), and its finder's own writes: the finder
+    // notes them, then looks again.
+    bool current() const noexcept;
+    void noteOwnWrites() noexcept;
+
     // Drops the references to definitions taken out during the call. Their
     // release can run Python code (a logical's last reference, a name's
     // finalizer), so it waits until the index is not in use.
@@ -208,6 +231,9 @@ private:
     void clear();
 
     py::Ref list_;
+    ListStamp* stamp_;  // the list's, shared with its other indexes
+    uint64_t seenWrites_ = 0;
+    uint64_t seenStrayWrites_ = 0;
     std::vector<Group*> slots_;  // open addressing, linear probing, into pool_
     std::deque<Group> pool_;      // never moves a group; freed ones are reused
     std::vector<Group*> free_;

@@ -162,6 +162,13 @@ DefIndex* definitionIndex(PyObject* self);
 // list (a direct call of a step, an exception, new state, a name it cannot
 // file). The call in progress goes on with the table walk.
 void dropDefinitionIndex(PyObject* self) noexcept;
+// A step called directly from Python: the finder's index goes, and those of
+// the other finders of its list go stale.
+void stepCalledDirectly(PyObject* self) noexcept;
+// At the start of every FindChanges, on either path: the index goes if
+// someone else wrote names of the list since its last call, and the other
+// finders' indexes of the list go stale.
+void callStarts(PyObject* self) noexcept;
 // When set, every native call ends by comparing the definition index with
 // the list (SystemError when they differ): the self-check of the replay,
 // turned on by SBC_CHECK_INDEX=1 in the environment at import.

@@ -377,8 +377,9 @@ py::Ref findChangesNative(PyObject* self, PyObject* addedList, PyObject* removed
             renumberToEnd(self);
         }
         result = nativeResult(s, std::move(spare));
-        // Kept for the next call only if it is known to match the list.
-        if (s.defIndex != nullptr && s.defIndex->hasCandidates()) {
+        // Kept for the next call only if it is known to match the list: no
+        // repairs left, and no one else wrote names of the list meanwhile.
+        if (s.defIndex != nullptr && (s.defIndex->hasCandidates() || !s.defIndex->current())) {
             dropDefinitionIndex(self);
         }
         if (s.defIndex != nullptr) {
@@ -448,6 +449,7 @@ py::Ref FindChanges(PyObject* self, PyObject* addedList, PyObject* removedList) 
     // The finder must outlive the call, whatever the steps' overrides drop.
     py::Ref keepSelf = py::Ref::own(self);
     InCall inCall(self);
+    callStarts(self);
     if (!anyStepOverridden(self) && nativeSiblingsCurrent() && fullNameFunctionCurrent()) {
         return findChangesNative(self, addedList, removedList);
     }

@@ -3,6 +3,7 @@
 #include "pysource/scopebodycache/utilities.hpp"
 
 #include "pysource/contracts/accessors.hpp"
+#include "pysource/scopebodycache/def_index.hpp"
 #include "pysource/scopebodycache/function.hpp"
 #include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/report.hpp"
@@ -88,6 +89,7 @@ PyObject* py_GetLocalScopeDefined(PyObject*, PyObject* const* a) {
 
 PyObject* py_SetLogicalLocalScopeDefined(PyObject*, PyObject* const* a) {
     setLocalScopeDefined(requireLogical(a[0]), a[1]);
+    noteStrayNamesWritten();  // of a list no one can tell
     return py::Ref::none().release();
 }
 
