@@ -83,6 +83,27 @@ class SharedLists(unittest.TestCase):
             self.assertEqual(self.Run(CChangeFinder, tell), routed, label)
 
 
+class Namesakes(unittest.TestCase):
+
+    def testManyNamesakesRenumberedFromTheTop(self):
+        # Adding and taking out one of many same-named definitions near the
+        # top renumbers every later one; the native path answers as the
+        # routed one does (its cost is shown by bench/bench_edits.py).
+        defs = ['def f():\n    x = %d\n\n' % k for k in range(300)]
+        source = ''.join(defs)
+        header = 'def f():\n    y = 0\n'
+        outcomes = []
+        for path in kPaths:
+            lst, finder = Named(source, path)
+            seen = []
+            for text in (header + source, source, ''.join(defs[:5]) + header + ''.join(defs[5:]), source):
+                changes = finder.FindChanges(*Edit(lst, text))
+                seen.append((changes, Names(lst)))
+                self.assertEqual(Names(lst), WholeListNames(text), path.__name__)
+            outcomes.append(seen)
+        self.assertEqual(outcomes[0], outcomes[1])
+
+
 class FailedCalls(unittest.TestCase):
 
     def testBadAddedItemAfterGoodOnesChangesNoLogical(self):

@@ -89,7 +89,7 @@ private:
         V value{};
     };
     static size_t home(const void* key, size_t mask) noexcept {
-        return (reinterpret_cast<uintptr_t>(key) >> 4) * 0x9E3779B97F4A7C15ull >> 20 & mask;
+        return (reinterpret_cast<uintptr_t>(key) >> 4) * 0x9E3779B97F4A7C15ull >> 32 & mask;
     }
     void place(const void* key, V value) noexcept {
         const size_t mask = slots_.size() - 1;
@@ -176,8 +176,9 @@ public:
     // matches the list (a member is not where it can be found).
     Py_ssize_t countBefore(PyObject* scope, const DefinedName& name, Py_ssize_t at);
 
-    // The position of a member in its group, or -1.
-    Py_ssize_t positionOf(PyObject* def);
+    // The position of a member in its group, or -1; `hint` is where in the
+    // list it stood when last seen.
+    Py_ssize_t positionOf(PyObject* def, Py_ssize_t hint = -1);
 
     // Pops the queued candidate with the lowest list index below `end`.
     bool popCandidate(Py_ssize_t end, Candidate* out);
@@ -226,6 +227,8 @@ private:
     void erase(Group* group);
     void grow();
     Py_ssize_t indexOf(Member& member);  // the member's list index, or -1
+    Py_ssize_t listIndexOf(PyObject* def, Py_ssize_t hint);
+    Py_ssize_t lastShift_ = 0;  // how far the last member found had moved
     Py_ssize_t lowerBound(Group& group, Py_ssize_t at);  // first member not before `at`
     void queueFrom(Group& group, size_t position);
     void clear();

@@ -107,7 +107,7 @@ void repairQueuedBefore(PyObject* self, Py_ssize_t end) {
     // A repair may drop the index (a name it cannot file): fetched afresh.
     while (DefIndex* index = definitionIndex(self)) {
         if (!index->popCandidate(end, &candidate)) return;
-        const Py_ssize_t position = index->positionOf(candidate.def.get());
+        const Py_ssize_t position = index->positionOf(candidate.def.get(), candidate.at);
         if (position < 0) continue;  // no longer filed
         DefinedName name;
         readDefinedName(candidate.def.get(), &name);
