@@ -7,7 +7,7 @@ import sys
 import unittest
 
 import pysource.symbolinfo as symbolinfo
-from support import PY3, Edit, Names, Read, WholeListNames
+from support import PY3, Edit, Names, Read, RunPython, WholeListNames
 from pysource.scopebodycache import CChangeFinder, GetInfoBytesKind, IsDefKind
 
 OPTIMISED = bool(sys.flags.optimize)
@@ -28,6 +28,77 @@ def Named(source, finder_class=CChangeFinder):
     finder = finder_class(lst)
     finder.FindChanges(lst, [])
     return lst, finder
+
+
+# Run in a fresh interpreter: a finder made before #DROP keeps working
+# after it, and honours a rebinding of GetFullNameForScopeDef in the module
+# that sys.modules then holds.
+kReloadScript = r'''
+import gc, sys
+import pysource, pysource.scopebodycache
+from pysource.logicals import ReadLogicals
+#FIRST
+mod = sys.modules['pysource.scopebodycache']
+lst = ReadLogicals('class A:\n    def f(self):\n        x = 1\n')
+finder = mod.CChangeFinder(lst)
+finder.FindChanges(lst, [])
+#DROP
+del mod
+gc.collect()
+# What reuses the freed memory must not be taken for the module's globals.
+class Trap(object):
+    def __call__(self, *args):
+        raise RuntimeError('a stray object was called')
+    def __getattr__(self, name):
+        return self
+junk = [dict(_fastaccess=Trap(), symbolinfo=Trap(), GetFullNameForScopeDef=Trap()) for _ in range(2000)]
+
+def Type(text):
+    new = ReadLogicals('class A:\n    def f(self):\n        %s\n' % text)[2]
+    old, lst[2] = lst[2], new
+    return finder.FindChanges([new], [old])
+
+assert Type('x = 2')[0] == set(['A#0.f#0'])
+current = sys.modules.get('pysource.scopebodycache')
+if current is not None:
+    seen, real = [], current.GetFullNameForScopeDef
+    current.GetFullNameForScopeDef = lambda d: seen.append(d) or real(d)
+    assert Type('x = 3')[0] == set(['A#0.f#0'])
+    assert [l.fTokens[1] for l in seen] == ['f'], seen
+    current.GetFullNameForScopeDef = real
+    assert current.CChangeFinder is type(finder)
+assert [l.fScopeName for l in lst] == ['', 'A#0', 'A#0.f#0']
+sys.stdout.write('ok\n')
+'''
+
+
+class Reloads(unittest.TestCase):
+
+    def Run(self, drop, first=''):
+        code = kReloadScript.replace('#FIRST', first).replace('#DROP', drop)
+        status, out, err = RunPython(code)
+        self.assertEqual((status, out), (0, 'ok\n'), err)
+
+    def testFinderOutlivesTheModuleObject(self):
+        # Out of sys.modules and of the package, as a plugin reloader does.
+        self.Run("del sys.modules['pysource.scopebodycache'], pysource.scopebodycache")
+
+    def testRebindingHonouredAfterASecondImport(self):
+        self.Run("del sys.modules['pysource.scopebodycache']\nimport pysource.scopebodycache")
+        # The module object kept by the package is not the one callers see.
+        self.Run("del sys.modules['pysource.scopebodycache']\n"
+                 "import pysource.scopebodycache\nmod = pysource\n")
+
+    @unittest.skipUnless(PY3, 'subinterpreters of the test module are 3.x')
+    def testRebindingHonouredAfterASubinterpreterImportedFirst(self):
+        try:
+            import _testcapi
+            _testcapi.run_in_subinterp
+        except (ImportError, AttributeError):
+            self.skipTest('no legacy subinterpreters here')
+        self.Run('', first="import _testcapi\n"
+                           "assert _testcapi.run_in_subinterp('import pysource.scopebodycache') == 0\n"
+                           "import pysource.scopebodycache\n")
 
 
 class StrayBrackets(unittest.TestCase):

@@ -23,7 +23,22 @@ struct SymbolInfo {
 extern PyObject* gTimeFunc;         // __TimeFunc
 extern PyTypeObject* gDestroyableType;
 extern SymbolInfo gSymbolInfo;
-extern PyObject* gModuleDict;  // this module's namespace, for by-name lookups
+// The namespace the module looks its globals up in: that of the module
+// object callers now see. The module holds every module object it has
+// looked names up in, so none is freed (2.7 empties a module's namespace
+// when it frees it) while a finder may still use it.
+extern PyObject* gModule;      // owned
+extern PyObject* gModuleDict;  // its namespace, for by-name lookups
+// At the end of a successful init: the module object made there.
+void holdModule(PyObject* module);
+// The module found under this module's name in sys.modules, when it is not
+// the one names are looked up in, becomes that one: a second import (taken
+// out of sys.modules and imported again; on 3.12 on, also the first import
+// in the main interpreter after a subinterpreter's) makes a new module
+// object whose globals callers rebind. One absent from sys.modules (a
+// plugin reloader drops it) leaves the last one in use. Cheap when nothing
+// changed; may release nothing and runs no Python code.
+void followCurrentModule() noexcept;
 
 // Import-time binding, in the order the init sequence needs it.
 void bindDestroyableBase();
