@@ -134,6 +134,10 @@ inline uint32_t strCharAt(PyObject* s, Py_ssize_t i) {
 #endif
 }
 
+// Whether the interpreter's report of an exception that cannot be raised
+// (sys.unraisablehook's default, 3.8 on) prints its traceback.
+inline constexpr bool kUnraisableHookPrintsTraceback = PY_VERSION_HEX >= 0x03080000;
+
 // A new str from bytes (UTF-8 on 3.x); null with an exception set.
 inline PyObject* strFromBytes(const char* data, Py_ssize_t size) noexcept {
 #if PY_MAJOR_VERSION >= 3
