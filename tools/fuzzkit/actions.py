@@ -1,7 +1,7 @@
 """The actions an episode is made of, by profile. Each takes the episode
 Context, makes its calls through ctx.Call and checks what its oracles can
 check; they live by concern in edits, pickles, badargs, overrides and
-shared, and the planted faults here."""
+shared, the planted faults here."""
 
 import time
 
@@ -11,11 +11,12 @@ from fuzzkit.names import NameScript, Rows
 from fuzzkit.overrides import (GlobalRebind, HostileCache, HostileEdit, OnFire,  # noqa: F401
                                ThreadEdit)
 from fuzzkit.pickles import BadSetstate, BadUnpickle, RoundTrip  # noqa: F401
+from fuzzkit.shared import BadAfterGood, Reload, SharedFinders  # noqa: F401
 
 kClean = [('Edit', 12), ('Lookups', 3), ('CacheClear', 2), ('RoundTrip', 2), ('Destroy', 1),
-          ('WholePassAgain', 1), ('Undo', 1)]
+          ('WholePassAgain', 1), ('Undo', 1), ('SharedFinders', 2), ('Reload', 1)]
 kBad = [('Edit', 3), ('BadCall', 12), ('BadEdit', 5), ('BadListItem', 3), ('DirectStep', 3),
-        ('Propagate', 2)]
+        ('Propagate', 2), ('BadAfterGood', 3)]
 kHostile = [('Edit', 2), ('HostileEdit', 12), ('HostileCache', 4), ('GlobalRebind', 4),
             ('ThreadEdit', 2)]
 kPickles = [('Edit', 2), ('RoundTrip', 3), ('BadUnpickle', 10), ('BadSetstate', 4)]
