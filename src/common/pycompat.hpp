@@ -134,6 +134,15 @@ inline uint32_t strCharAt(PyObject* s, Py_ssize_t i) {
 #endif
 }
 
+// sys.modules of the running interpreter (borrowed).
+inline PyObject* modulesDict() noexcept {
+#if PY_MAJOR_VERSION >= 3
+    return PyImport_GetModuleDict();
+#else
+    return PyThreadState_GET()->interp->modules;
+#endif
+}
+
 // Whether the interpreter's report of an exception that cannot be raised
 // (sys.unraisablehook's default, 3.8 on) prints its traceback.
 inline constexpr bool kUnraisableHookPrintsTraceback = PY_VERSION_HEX >= 0x03080000;
@@ -602,6 +611,7 @@ private:
 #if PY_MAJOR_VERSION < 3
     void* table_ = nullptr;
     void* entry_ = nullptr;
+    PyObject* key_ = nullptr;  // compared only
 #elif PY_VERSION_HEX < 0x030C0000
     uint64_t version_ = 0;
 #else
@@ -613,19 +623,23 @@ private:
 
 inline bool DictWatch::enable(PyObject*) noexcept { return true; }
 
-inline bool DictWatch::unchanged(PyObject* dict, PyObject* name, PyObject* expected) const noexcept {
+inline bool DictWatch::unchanged(PyObject* dict, PyObject*, PyObject* expected) const noexcept {
     if (!watched_ || !marked_) return false;
     auto* d = reinterpret_cast<PyDictObject*>(dict);
     if (table_ != d->ma_table) return false;
     auto* e = static_cast<PyDictEntry*>(entry_);
-    return e->me_key == name && e->me_value == expected;
+    return e->me_key == key_ && e->me_value == expected;
 }
 
+// The key the entry holds, which need not be the very object looked up
+// with (sys.modules keys are not interned).
 inline void DictWatch::mark(PyObject* dict, PyObject* name) noexcept {
     auto* d = reinterpret_cast<PyDictObject*>(dict);
     table_ = d->ma_table;
-    entry_ = d->ma_lookup(d, name, reinterpret_cast<PyStringObject*>(name)->ob_shash);
-    marked_ = true;
+    auto* e = d->ma_lookup(d, name, reinterpret_cast<PyStringObject*>(name)->ob_shash);
+    entry_ = e;
+    key_ = e != nullptr ? e->me_key : nullptr;
+    marked_ = e != nullptr && key_ != nullptr;
 }
 
 #elif PY_VERSION_HEX < 0x030C0000

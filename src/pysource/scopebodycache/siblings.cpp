@@ -16,6 +16,8 @@ PyTypeObject* gDestroyableType = nullptr;
 SymbolInfo gSymbolInfo;
 PyObject* gModule = nullptr;
 PyObject* gModuleDict = nullptr;
+PyObject* gWatchedModules = nullptr;
+WatchedName gWatchedModule;  // sys.modules[<name>] is gModule
 
 namespace {
 
@@ -240,9 +242,8 @@ void WatchedName::watch(PyObject* dict, PyObject* name, PyObject* expected) noex
     since_.watch(dict);
 }
 
-bool WatchedName::holds() noexcept {
+bool WatchedName::holdsAfterLookup() noexcept {
     if (dict_ == nullptr || expected_ == nullptr) return false;
-    if (since_.unchanged(dict_, name_, expected_)) return true;
     if (PyDict_GetItem(dict_, name_) != expected_) return false;
     since_.mark(dict_, name_);
     return true;
@@ -250,8 +251,6 @@ bool WatchedName::holds() noexcept {
 
 namespace {
 
-WatchedName gWatchedModule;            // sys.modules[<name>] is gModule
-PyObject* gWatchedModules = nullptr;   // the sys.modules it watches (compared only)
 std::vector<PyObject*> gHeld;          // owned for good: modules once in use
 
 // `module.name` is the very function bound at import (borrowed lookups).
@@ -294,11 +293,10 @@ void holdModule(PyObject* module) {
     gWatchedModules = nullptr;  // watched at the first use
 }
 
-void followCurrentModule() noexcept {
+void followCurrentModuleAfterLookup() noexcept {
     if (gModule == nullptr) return;  // during init
-    PyObject* modules = PyImport_GetModuleDict();
+    PyObject* modules = compat::modulesDict();
     if (modules == nullptr) return;
-    if (modules == gWatchedModules && gWatchedModule.holds()) return;
     PyObject* current = PyDict_GetItem(modules, gNames.moduleName);
     if (current == gModule) {
         gWatchedModules = modules;
