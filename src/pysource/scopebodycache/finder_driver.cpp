@@ -443,7 +443,9 @@ private:
 // point above or below the place the logical left; the logical standing
 // there is then not visited unless something else leads to it, and lines
 // that took their scope from the removed one can keep stale names. A call
-// with one change is the same under both readings.
+// with one change is the same under both readings. Lines that belong to no
+// logical taken out with a class/def leave its old body numbered below it:
+// the body is found by its names (processRemoved).
 py::Ref FindChanges(PyObject* self, PyObject* addedList, PyObject* removedList) {
     if (finderState(self).contentsChanges != Py_None) msg::raise(PyExc_ValueError, msg::kRecursive);
     // The finder must outlive the call, whatever the steps' overrides drop.
