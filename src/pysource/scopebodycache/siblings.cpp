@@ -251,7 +251,6 @@ bool WatchedName::holdsAfterLookup() noexcept {
 
 namespace {
 
-std::vector<PyObject*> gHeld;          // owned for good: modules once in use
 
 // `module.name` is the very function bound at import (borrowed lookups).
 bool holdsFunction(PyObject* module, PyObject* name, PyObject* function) {
@@ -268,14 +267,14 @@ void rewatchSiblings(PyObject* dict) noexcept {
     if (fastaccess != nullptr && fastaccess != n.fastaccess && PyModule_Check(fastaccess) &&
         holdsFunction(fastaccess, gNames.IndexForLineno, n.indexForLinenoFunction) &&
         holdsFunction(fastaccess, gNames.FindIndexOfLogical, n.findIndexOfLogicalFunction)) {
-        gHeld.push_back(n.fastaccess);
+        py::Ref old = py::Ref::steal(n.fastaccess);  // released once nothing reads it
         n.fastaccess = py::Ref::own(fastaccess).release();
         gWatched[2].watch(PyModule_GetDict(fastaccess), gNames.IndexForLineno, n.indexForLinenoFunction);
         gWatched[3].watch(PyModule_GetDict(fastaccess), gNames.FindIndexOfLogical, n.findIndexOfLogicalFunction);
     }
     if (symbolinfo != nullptr && symbolinfo != n.symbolinfo && PyModule_Check(symbolinfo) &&
         holdsFunction(symbolinfo, gNames.LeafScopeNameHasIndex, n.leafScopeNameHasIndexFunction)) {
-        gHeld.push_back(n.symbolinfo);
+        py::Ref old = py::Ref::steal(n.symbolinfo);
         n.symbolinfo = py::Ref::own(symbolinfo).release();
         gWatched[4].watch(PyModule_GetDict(symbolinfo), gNames.LeafScopeNameHasIndex,
                           n.leafScopeNameHasIndexFunction);
@@ -305,12 +304,10 @@ void followCurrentModuleAfterLookup() noexcept {
         return;
     }
     if (current == nullptr || !PyModule_Check(current)) return;
-    try {
-        gHeld.reserve(gHeld.size() + 3);
-    } catch (...) {
-        return;  // out of memory: the old namespace stays in use
-    }
-    gHeld.push_back(gModule);
+    // The one in use until now goes last, when every global points at the
+    // new one: its release may free it (2.7 then empties its namespace) and
+    // run finalizers, as any lookup of a global may.
+    py::Ref old = py::Ref::steal(gModule);
     gModule = py::Ref::own(current).release();
     gModuleDict = PyModule_GetDict(current);
     rewatchSiblings(gModuleDict);

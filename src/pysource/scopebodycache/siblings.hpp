@@ -24,9 +24,9 @@ extern PyObject* gTimeFunc;         // __TimeFunc
 extern PyTypeObject* gDestroyableType;
 extern SymbolInfo gSymbolInfo;
 // The namespace the module looks its globals up in: that of the module
-// object callers now see. The module holds every module object it has
-// looked names up in, so none is freed (2.7 empties a module's namespace
-// when it frees it) while a finder may still use it.
+// object callers now see. The module holds the module object it looks
+// names up in, so it is not freed (2.7 empties a module's namespace when it
+// frees it) while a finder may still use it.
 extern PyObject* gModule;      // owned
 extern PyObject* gModuleDict;  // its namespace, for by-name lookups
 // At the end of a successful init: the module object made there.
