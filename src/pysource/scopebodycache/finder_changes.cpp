@@ -121,7 +121,14 @@ void processRemoved(PyObject* self, PyObject* removedList, IndexList& result) {
         if (runStart < 0 || logical->fLineno <= runLine) runStart = at;
         runStart = std::min(runStart, at);
         runLine = logical->fLineno;
-        const Py_ssize_t body = oldBodyStart(self, logical, at, runStart);
+        // A class/def replaced where it stood (typing in a header) has its
+        // body after the one that replaced it.
+        const NativePass* pass = finderState(self).native;
+        const bool replacedInPlace = pass != nullptr && pass->replacedDefinition.get() == logical.get() &&
+                                     at < PyList_GET_SIZE(finderState(self).logicalList) &&
+                                     PyList_GET_ITEM(finderState(self).logicalList, at) ==
+                                         pass->replacingDefinition.get();
+        const Py_ssize_t body = replacedInPlace ? -1 : oldBodyStart(self, logical, at, runStart);
         n = logicalListLength(self);
         if (body >= 0 && body < n && body != lastIndex) {
             result.append(body);
