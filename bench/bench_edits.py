@@ -19,6 +19,13 @@ process CPU time divided by its FindChanges calls:
   batch        three typed statements and such a comment in one call, and
                the undo in one call.
 
+A second table takes the shape where a definition edit renumbers many
+namesakes: a module of nothing but `def f` (a third of its logicals), one
+more `def f` inserted near the top and taken out again, on the native path
+and through the overrides (a subclass that overrides `_Clear`), in
+milliseconds per call. The native path must stay within a small factor of
+the routed one: both renumber every later `def f`.
+
 The caller's own work in each batch (the list assignments, inserts and
 deletes) is timed alone just before it and taken off, so the figures are the calls,
 including the Python call itself. Each cell is the median over batches with
@@ -33,7 +40,7 @@ import sys
 import benchkit
 from benchkit import CChangeFinder, FormatSpread, LogicalLineType, Spread, TimeBatches
 
-from pysource.logicals import kCommentKind, kDefKind
+from pysource.logicals import kBlankKind, kCommentKind, kDefKind
 
 try:
     xrange
@@ -198,6 +205,44 @@ def Bench(size, batches, calls):
     return len(lst), rows, NamesAgree(lst)
 
 
+class Routed(CChangeFinder):
+    """Every step through the overrides' route."""
+
+    def _Clear(self):
+        CChangeFinder._Clear(self)
+
+
+def NamesakeList(size, finder_class):
+    """`def f():`, its body and a blank line, size // 3 times, named."""
+    lst = []
+    for k in xrange(max(1, size // 3)):
+        line = 3 * k * benchkit.kLineStep + 1
+        lst.append(LogicalLineType(('def', 'f', '(', ')', ':'), line, 0, kDefKind))
+        lst.append(LogicalLineType(('x', '=', '1'), line + benchkit.kLineStep, 4, 0))
+        lst.append(LogicalLineType((), line + 2 * benchkit.kLineStep, 0, kBlankKind))
+    finder = finder_class(lst)
+    finder.FindChanges(lst, [])
+    return lst, finder
+
+
+def BenchNamesakes(size, batches):
+    """ms per call of a `def f` in and out near the top, native and routed."""
+    row = {}
+    for label, finder_class in (('native', CChangeFinder), ('routed', Routed)):
+        lst, finder = NamesakeList(size, finder_class)
+        i = 30
+        new = LogicalLineType(('def', 'f', '(', ')', ':'), lst[i].fLineno - 1, 0, kDefKind)
+        run, bare = InAndOut(lst, finder, i, new)
+        run(2)  # warm up
+        figures = []
+        for _ in range(batches):
+            caller = TimeBatches(bare, 1, 2)[0]
+            figures.append((TimeBatches(run, 1, 2)[0] - caller) * 1e3)
+        row[label] = figures
+        row[label + ' agree'] = NamesAgree(lst)
+    return len(lst), row
+
+
 def main(argv=None):
     parser = argparse.ArgumentParser(description=__doc__.splitlines()[0])
     parser.add_argument('--sizes', default='1000,10000,100000',
@@ -224,8 +269,19 @@ def main(argv=None):
     for count, rows, agree in results:
         print('%d logicals: names after the edits %s a fresh pass' % (count, 'agree with' if agree else
                                                                         'DISAGREE with'))
+    namesakes = [BenchNamesakes(int(s), max(3, args.batches // 3)) for s in args.sizes.split(',')]
+    print('\nMilliseconds per call, a `def f` in and out near the top of a module of `def f` only,'
+          ' median [10th-90th percentile]')
+    print('%-9s %-9s %-22s %-22s %s' % ('logicals', 'namesakes', 'native', 'routed', 'native/routed'))
+    agree = True
+    for count, row in namesakes:
+        print('%-9d %-9d %-22s %-22s %.2fx' % (count, count // 3, FormatSpread(row['native'], digits=3),
+                                                FormatSpread(row['routed'], digits=3),
+                                                Spread(row['native'])[0] / max(Spread(row['routed'])[0], 1e-6)))
+        agree = agree and row['native agree'] and row['routed agree']
+    print('namesakes: names after the edits %s a fresh pass' % ('agree with' if agree else 'DISAGREE with'))
     print('peak memory (ru_maxrss): %.1f MiB' % benchkit.PeakRssMiB())
-    return 0 if all(r[2] for r in results) else 1
+    return 0 if all(r[2] for r in results) and agree else 1
 
 
 if __name__ == '__main__':

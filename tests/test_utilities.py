@@ -158,7 +158,14 @@ class SmallFunctionsTest(unittest.TestCase):
             sys.unraisablehook = saved
         self.assertEqual([(u.exc_type, u.object) for u in seen],
                          [(TypeError, 'pysource.symbolinfo.GetInfoBytesKind')])
-        self.assertIn('TypeError', err.getvalue())  # the traceback, printed first
+        # The hook reports it; nothing is printed besides.
+        self.assertEqual(err.getvalue(), '')
+        with CapturedStderr() as err:
+            self.assertEqual(GetInfoBytesKind(None), 0)
+        # The default hook's form, once.
+        self.assertEqual(err.getvalue().count('TypeError'), 1, err.getvalue())
+        self.assertTrue(err.getvalue().startswith(
+            "Exception ignored in: 'pysource.symbolinfo.GetInfoBytesKind'\nTraceback"), err.getvalue())
 
 
 if __name__ == '__main__':

@@ -9,6 +9,8 @@
 #pragma once
 
 #include <Python.h>
+
+#include <cstdint>
 #include <frameobject.h>
 
 #include <cstdarg>
@@ -113,7 +115,8 @@ inline const char* otherTextBytes(PyObject* o, py::Ref* holder) {
 }
 
 // The length of a str in characters (bytes on 2.7), and the character at
-// `i` (< length) as a C char: its low 8 bits on 3.x.
+// `i` (< length) as a code point (a byte's value, 0-255, on 2.7): a
+// character above U+00FF is never narrowed to a byte.
 inline Py_ssize_t strLength(PyObject* s) {
 #if PY_MAJOR_VERSION >= 3
     return py::checkSize(PyUnicode_GetLength(s));
@@ -122,15 +125,28 @@ inline Py_ssize_t strLength(PyObject* s) {
 #endif
 }
 
-inline char strCharAt(PyObject* s, Py_ssize_t i) {
+inline uint32_t strCharAt(PyObject* s, Py_ssize_t i) {
 #if PY_MAJOR_VERSION >= 3
     const Py_UCS4 c = PyUnicode_ReadChar(s, i);
     if (c == static_cast<Py_UCS4>(-1) && PyErr_Occurred()) py::fail();
-    return static_cast<char>(c & 0xFF);
+    return c;
 #else
-    return PyString_AS_STRING(s)[i];
+    return static_cast<unsigned char>(PyString_AS_STRING(s)[i]);
 #endif
 }
+
+// sys.modules of the running interpreter (borrowed).
+inline PyObject* modulesDict() noexcept {
+#if PY_MAJOR_VERSION >= 3
+    return PyImport_GetModuleDict();
+#else
+    return PyThreadState_GET()->interp->modules;
+#endif
+}
+
+// Whether the interpreter's report of an exception that cannot be raised
+// (sys.unraisablehook's default, 3.8 on) prints its traceback.
+inline constexpr bool kUnraisableHookPrintsTraceback = PY_VERSION_HEX >= 0x03080000;
 
 // A new str from bytes (UTF-8 on 3.x); null with an exception set.
 inline PyObject* strFromBytes(const char* data, Py_ssize_t size) noexcept {
@@ -697,6 +713,7 @@ private:
 #if PY_MAJOR_VERSION < 3
     void* table_ = nullptr;
     void* entry_ = nullptr;
+    PyObject* key_ = nullptr;  // compared only
 #elif PY_VERSION_HEX < 0x030C0000
     uint64_t version_ = 0;
 #else
@@ -708,19 +725,23 @@ private:
 
 inline bool DictWatch::enable(PyObject*) noexcept { return true; }
 
-inline bool DictWatch::unchanged(PyObject* dict, PyObject* name, PyObject* expected) const noexcept {
+inline bool DictWatch::unchanged(PyObject* dict, PyObject*, PyObject* expected) const noexcept {
     if (!watched_ || !marked_) return false;
     auto* d = reinterpret_cast<PyDictObject*>(dict);
     if (table_ != d->ma_table) return false;
     auto* e = static_cast<PyDictEntry*>(entry_);
-    return e->me_key == name && e->me_value == expected;
+    return e->me_key == key_ && e->me_value == expected;
 }
 
+// The key the entry holds, which need not be the very object looked up
+// with (sys.modules keys are not interned).
 inline void DictWatch::mark(PyObject* dict, PyObject* name) noexcept {
     auto* d = reinterpret_cast<PyDictObject*>(dict);
     table_ = d->ma_table;
-    entry_ = d->ma_lookup(d, name, reinterpret_cast<PyStringObject*>(name)->ob_shash);
-    marked_ = true;
+    auto* e = d->ma_lookup(d, name, reinterpret_cast<PyStringObject*>(name)->ob_shash);
+    entry_ = e;
+    key_ = e != nullptr ? e->me_key : nullptr;
+    marked_ = e != nullptr && key_ != nullptr;
 }
 
 #elif PY_VERSION_HEX < 0x030C0000

@@ -65,7 +65,8 @@ def _Census():
     the process's resident memory."""
     for name in ('last_type', 'last_value', 'last_traceback'):
         setattr(sys, name, None)
-    sys.exc_clear()
+    if hasattr(sys, 'exc_clear'):  # 2.7: the exception last handled; 3.x drops it itself
+        sys.exc_clear()
     gc.collect()
     gc.collect()
     counts = {}

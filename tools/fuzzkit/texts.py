@@ -145,7 +145,8 @@ class Splice(object):
 class EditMaker(object):
     kKinds = (('type', 14), ('insert_lines', 10), ('insert_header', 8), ('insert_comment', 10),
               ('insert_blank', 5), ('delete_lines', 9), ('reindent', 8), ('reindent_block', 4),
-              ('duplicate_block', 4), ('comment_out', 4), ('rename', 6), ('split_join', 3))
+              ('duplicate_block', 4), ('comment_out', 4), ('rename', 6), ('split_join', 3),
+              ('stray_bracket', 4), ('missing_bracket', 3), ('delete_from_blank', 3))
 
     def __init__(self, rng, source_maker):
         self.rng = rng
@@ -216,6 +217,39 @@ class EditMaker(object):
     def _insert_blank(self, lines, lo):
         new = [self.rng.choice(['', '', '    ', '\t', '  ']) for _ in range(self.rng.randint(1, 3))]
         return Splice(self._At(lines, lo), 0, new, '')
+
+    def _stray_bracket(self, lines, lo):
+        # A closing bracket with no opener, as text being typed holds: the
+        # reader makes no logical of the blank lines after it, which a later
+        # deletion may take out with the lines under them.
+        i = self._Line(lines, lo, lambda line: line.strip() and not line.strip().startswith('#'))
+        if i is None:
+            return None
+        new = [lines[i].rstrip() + self.rng.choice(')]}')]
+        new.extend([''] * self.rng.choice([0, 1, 1, 2]))
+        return Splice(i, 1, new, '')
+
+    def _missing_bracket(self, lines, lo):
+        # A bracket typed away, or an opener typed in: a closer later on may
+        # then be a stray one, or the text no longer reads.
+        i = self._Line(lines, lo, lambda line: any(c in line for c in '()[]{}'))
+        if i is None:
+            return None
+        line = lines[i]
+        at = [k for k, c in enumerate(line) if c in '()[]{}']
+        if self.rng.random() < 0.3:
+            k = self.rng.randint(0, len(line))
+            return Splice(i, 1, [line[:k] + self.rng.choice('([{') + line[k:]], '')
+        k = self.rng.choice(at)
+        return Splice(i, 1, [line[:k] + line[k + 1:]], '')
+
+    def _delete_from_blank(self, lines, lo):
+        # A span that starts at a blank line and takes the lines under it,
+        # headers included.
+        i = self._Line(lines, lo, lambda line: not line.strip())
+        if i is None:
+            return None
+        return Splice(i, min(len(lines) - i, self.rng.choice([2, 2, 3, 4, 6])), [], '')
 
     def _delete_lines(self, lines, lo):
         i = self._Line(lines, lo)

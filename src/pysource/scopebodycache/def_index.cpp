@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <unordered_map>
 
 namespace sbc {
 
@@ -42,11 +43,48 @@ py::Ref bareNameOf(PyObject* logical, const DefinedName& name) {
     return py::check(compat::strFromBytes(whole.data(), name.bareLength));
 }
 
-DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(64, nullptr) {}
+namespace {
+
+// The stamps of the lists that have an index, by list. An index holds its
+// list, so no other list can take the address while the stamp is in use.
+std::unordered_map<const PyObject*, ListStamp>& stamps() {
+    static auto* map = new std::unordered_map<const PyObject*, ListStamp>();  // never freed: used at exit
+    return *map;
+}
+
+uint64_t gStrayWrites = 0;
+
+}  // namespace
+
+void noteNamesWritten(PyObject* list) noexcept {
+    auto& map = stamps();
+    if (map.empty()) return;
+    auto found = map.find(list);
+    if (found != map.end()) ++found->second.writes;
+}
+
+void noteStrayNamesWritten() noexcept { ++gStrayWrites; }
+
+DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(64, nullptr) {
+    stamp_ = &stamps()[list];  // node-based: the address stays
+    ++stamp_->indexes;
+    seenWrites_ = stamp_->writes;
+    seenStrayWrites_ = gStrayWrites;
+}
 
 DefIndex::~DefIndex() {
     clear();
     flushReleases();
+    if (--stamp_->indexes == 0) stamps().erase(list_.get());
+}
+
+bool DefIndex::current() const noexcept {
+    return stamp_->writes == seenWrites_ && gStrayWrites == seenStrayWrites_;
+}
+
+void DefIndex::noteOwnWrites() noexcept {
+    seenWrites_ = ++stamp_->writes;
+    seenStrayWrites_ = gStrayWrites;
 }
 
 void DefIndex::clear() {
@@ -142,17 +180,40 @@ void DefIndex::erase(Group* group) {
     free_.push_back(group);
 }
 
-Py_ssize_t DefIndex::indexOf(Member& member) {
+Py_ssize_t DefIndex::listIndexOf(PyObject* def, Py_ssize_t hint) {
     PyObject* list = list_.get();
-    if (member.at >= 0 && member.at < PyList_GET_SIZE(list) && PyList_GET_ITEM(list, member.at) == member.def) {
-        return member.at;
+    const Py_ssize_t n = PyList_GET_SIZE(list);
+    if (hint >= 0 && hint < n && PyList_GET_ITEM(list, hint) == def) return hint;
+    // An edit above moves every later member by as much as it moved the
+    // last one looked for.
+    const Py_ssize_t shifted = hint + lastShift_;
+    if (hint >= 0 && shifted >= 0 && shifted < n && PyList_GET_ITEM(list, shifted) == def) return shifted;
+    // Else each is found by its line number (the list is in line order) in
+    // log n, where a search from the top cost the file's length for each of
+    // a name's many definitions.
+    const int32_t lineno = asLogical(def)->fLineno;
+    Py_ssize_t j = gNative.indexForLineno != nullptr ? gNative.indexForLineno(list, lineno) : -1;
+    if (j < 0) PyErr_Clear();
+    for (; j >= 0 && j < n; ++j) {
+        PyObject* item = PyList_GET_ITEM(list, j);
+        if (item == def) {
+            if (hint >= 0) lastShift_ = j - hint;
+            return j;
+        }
+        if (!logicalCheck(item) || asLogical(item)->fLineno != lineno) break;
     }
-    const Py_ssize_t found = gNative.findIndexOfLogical(list, member.def);
+    // Out of line order (a caller's mistake): the search from the top.
+    const Py_ssize_t found = gNative.findIndexOfLogical(list, def);
     if (found < 0) {
         PyErr_Clear();
         return -1;
     }
-    member.at = found;
+    return found;
+}
+
+Py_ssize_t DefIndex::indexOf(Member& member) {
+    const Py_ssize_t found = listIndexOf(member.def, member.at);
+    if (found >= 0) member.at = found;
     return found;
 }
 
@@ -293,11 +354,21 @@ Py_ssize_t DefIndex::countBefore(PyObject* scope, const DefinedName& name, Py_ss
     return group == nullptr ? 0 : lowerBound(*group, at);
 }
 
-Py_ssize_t DefIndex::positionOf(PyObject* def) {
+Py_ssize_t DefIndex::positionOf(PyObject* def, Py_ssize_t hint) {
     ensureGroupOf();
     Group** found = groupOf_.find(def);
     if (found == nullptr) return -1;
-    auto& members = (*found)->members;
+    Group& group = **found;
+    auto& members = group.members;
+    if (members.size() > 8) {
+        // Members are in list order: a binary search, not a walk over a
+        // name's many definitions for each one renumbered.
+        const Py_ssize_t at = listIndexOf(def, hint);
+        const Py_ssize_t k = at < 0 ? -1 : lowerBound(group, at);
+        if (k < 0 || static_cast<size_t>(k) >= members.size() || members[k].def != def) return -1;
+        members[k].at = at;
+        return k;
+    }
     for (size_t k = 0; k < members.size(); ++k) {
         if (members[k].def == def) return indexOf(members[k]) < 0 ? -1 : static_cast<Py_ssize_t>(k);
     }

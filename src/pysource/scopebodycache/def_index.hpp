@@ -89,7 +89,7 @@ private:
         V value{};
     };
     static size_t home(const void* key, size_t mask) noexcept {
-        return (reinterpret_cast<uintptr_t>(key) >> 4) * 0x9E3779B97F4A7C15ull >> 20 & mask;
+        return (reinterpret_cast<uintptr_t>(key) >> 4) * 0x9E3779B97F4A7C15ull >> 32 & mask;
     }
     void place(const void* key, V value) noexcept {
         const size_t mask = slots_.size() - 1;
@@ -119,6 +119,23 @@ struct DefinedName {
         return compat::strViewOrEmpty(name).substr(0, static_cast<size_t>(bareLength));
     }
 };
+
+// Name writes, by logical list. Every finder of a list writes the names of
+// the same logicals, and a definition index mirrors those names only while
+// nothing else writes them: each list that has an index gets a stamp that
+// every writer advances (a FindChanges of any finder of the list, a step
+// called directly), and an index is trusted only while the stamp is the one
+// it last saw. Names written where the list cannot be told (a logical's
+// local name set through the module function) advance every stamp at once.
+struct ListStamp {
+    uint64_t writes = 0;
+    size_t indexes = 0;  // the indexes of the list that hold this stamp
+};
+// Someone is about to write names of `list`'s logicals: every index of the
+// list goes stale. Cheap when no index exists anywhere.
+void noteNamesWritten(PyObject* list) noexcept;
+// Names were written in a logical of a list unknown: every index goes stale.
+void noteStrayNamesWritten() noexcept;
 
 class DefIndex {
 public:
@@ -159,8 +176,9 @@ public:
     // matches the list (a member is not where it can be found).
     Py_ssize_t countBefore(PyObject* scope, const DefinedName& name, Py_ssize_t at);
 
-    // The position of a member in its group, or -1.
-    Py_ssize_t positionOf(PyObject* def);
+    // The position of a member in its group, or -1; `hint` is where in the
+    // list it stood when last seen.
+    Py_ssize_t positionOf(PyObject* def, Py_ssize_t hint = -1);
 
     // Pops the queued candidate with the lowest list index below `end`.
     bool popCandidate(Py_ssize_t end, Candidate* out);
@@ -168,6 +186,12 @@ public:
 
     // The list length when the last call ended, for the check at the next.
     Py_ssize_t recordedLength = -1;
+
+    // Whether no one but its finder has written names of the list since it
+    // last looked (see ListStamp), and its finder's own writes: the finder
+    // notes them, then looks again.
+    bool current() const noexcept;
+    void noteOwnWrites() noexcept;
 
     // Drops the references to definitions taken out during the call. Their
     // release can run Python code (a logical's last reference, a name's
@@ -203,11 +227,16 @@ private:
     void erase(Group* group);
     void grow();
     Py_ssize_t indexOf(Member& member);  // the member's list index, or -1
+    Py_ssize_t listIndexOf(PyObject* def, Py_ssize_t hint);
+    Py_ssize_t lastShift_ = 0;  // how far the last member found had moved
     Py_ssize_t lowerBound(Group& group, Py_ssize_t at);  // first member not before `at`
     void queueFrom(Group& group, size_t position);
     void clear();
 
     py::Ref list_;
+    ListStamp* stamp_;  // the list's, shared with its other indexes
+    uint64_t seenWrites_ = 0;
+    uint64_t seenStrayWrites_ = 0;
     std::vector<Group*> slots_;  // open addressing, linear probing, into pool_
     std::deque<Group> pool_;      // never moves a group; freed ones are reused
     std::vector<Group*> free_;

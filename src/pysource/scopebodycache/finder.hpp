@@ -97,6 +97,9 @@ struct FinderState {
     long owedScanIndent;
     // - the native pass of the call in progress (null otherwise);
     NativePass* native;
+    // - whether a FindChanges of this very finder is running, on either
+    //   path (a state applied to it then is its own business);
+    bool inCall;
     // - the definition index, kept between calls while it matches the list;
     DefIndex* defIndex;
     // - the tuple the last native call returned, with its three sets, while
@@ -159,6 +162,13 @@ DefIndex* definitionIndex(PyObject* self);
 // list (a direct call of a step, an exception, new state, a name it cannot
 // file). The call in progress goes on with the table walk.
 void dropDefinitionIndex(PyObject* self) noexcept;
+// A step called directly from Python: the finder's index goes, and those of
+// the other finders of its list go stale.
+void stepCalledDirectly(PyObject* self) noexcept;
+// At the start of every FindChanges, on either path: the index goes if
+// someone else wrote names of the list since its last call, and the other
+// finders' indexes of the list go stale.
+void callStarts(PyObject* self) noexcept;
 // When set, every native call ends by comparing the definition index with
 // the list (SystemError when they differ): the self-check of the replay,
 // turned on by SBC_CHECK_INDEX=1 in the environment at import.
@@ -226,6 +236,9 @@ void requireRunPlaced(Py_ssize_t end, Py_ssize_t at);
 // being passed as added can cause. AssertionError where the steps assert;
 // optimised, naming on would store None, so it is a RuntimeError.
 void requireScopeFound(PyObject* scope, Py_ssize_t i);
+// Whether `name` is the scope `prefix` or one nested in it (the prefix ends
+// at a separator). A name that is not a str is asked through Python.
+bool inScope(PyObject* name, PyObject* prefix);
 // A scope name about to be stored or used: str or None, else TypeError.
 void requireStrOrNone(PyObject* name);
 // `a, b = seq` (exactly two items) or, with firstTwo, `a, b = seq[:2]`.

@@ -6,6 +6,7 @@
 #include "pysource/scopebodycache/siblings.hpp"
 
 #include <algorithm>
+#include <vector>
 
 namespace sbc::finder {
 
@@ -54,6 +55,43 @@ Py_ssize_t indexByIdentity(PyObject* self, PyObject* logical) {
     return -1;
 }
 
+// The names taken off added logicals before they are visited, kept until the
+// visiting starts so that a failure before it can put them back.
+class NamesTakenOff {
+public:
+    NamesTakenOff() = default;
+    NamesTakenOff(const NamesTakenOff&) = delete;
+    NamesTakenOff& operator=(const NamesTakenOff&) = delete;
+
+    void takeOff(const LogicalRef& item) {
+        Logical* l = item.record();
+        if (l->fScopeName == nullptr && l->fLocalScopeName == nullptr) return;
+        kept_.push_back({LogicalRef::own(item.get()), py::Ref::own(l->fScopeName), py::Ref::own(l->fLocalScopeName)});
+        setScopeName(l, nullptr);
+        setLocalScopeDefined(l, nullptr);
+    }
+    // On the way out of a failure: the pending error waits while the old
+    // names go back (the releases can run Python code).
+    void putBack() noexcept {
+        py::SavedError pending;
+        for (Kept& k : kept_) {
+            Logical* l = k.item.record();
+            py::storeSlot(&l->fScopeName, k.scope.get());
+            py::storeSlot(&l->fLocalScopeName, k.local.get());
+        }
+        kept_.clear();
+        pending.restore();
+    }
+
+private:
+    struct Kept {
+        LogicalRef item;
+        py::Ref scope;
+        py::Ref local;
+    };
+    std::vector<Kept> kept_;
+};
+
 }  // namespace
 
 void ProcessAddedLogicals(PyObject* self, PyObject* addedList, PyObject* indices) {
@@ -66,24 +104,35 @@ void processAdded(PyObject* self, PyObject* addedList, IndexList& indices) {
     const bool native = nativePass(self);
     s.lastProcessedIndex = -1;
     if (addedList == Py_None) msg::raise(PyExc_TypeError, msg::kNoneNotIterable);
-    for (Py_ssize_t k = 0; k < PyList_GET_SIZE(addedList); ++k) {
-        LogicalRef item = LogicalRef::own(PyList_GET_ITEM(addedList, k));
-        Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get(), native);
-        assertListItemIs(self, i, item.get());
-        // Optimised, nothing above caught an answer that is not where the
-        // logical stands: look for it, and skip one that is not in the list
-        // rather than name whatever stands at the answer.
-        if (!isItemAt(self, i, item.get())) i = indexByIdentity(self, item.get());
-        if (i < 0) continue;
-        // An added logical is new whatever it carries (an undo may put back
-        // the very objects it removed, with their old names): it is named
-        // afresh, so the scan it starts is not cut short by stale names.
-        if (isScopeStart(item.record())) unfileDefinition(self, item.get());
-        setScopeName(item.record(), nullptr);
-        setLocalScopeDefined(item.record(), nullptr);
-        indices.append(i);
+    {
+        // A call that fails on its arguments (an item that is not a logical,
+        // one not in the list) leaves every logical as it found it: the names
+        // taken off the items before are put back.
+        NamesTakenOff takenOff;
+        try {
+            for (Py_ssize_t k = 0; k < PyList_GET_SIZE(addedList); ++k) {
+                LogicalRef item = LogicalRef::own(PyList_GET_ITEM(addedList, k));
+                Py_ssize_t i = findIndexOfLogical(s.logicalList, item.get(), native);
+                assertListItemIs(self, i, item.get());
+                // Optimised, nothing above caught an answer that is not where
+                // the logical stands: look for it, and skip one that is not in
+                // the list rather than name whatever stands at the answer.
+                if (!isItemAt(self, i, item.get())) i = indexByIdentity(self, item.get());
+                if (i < 0) continue;
+                // An added logical is new whatever it carries (an undo may put
+                // back the very objects it removed, with their old names): it
+                // is named afresh, so the scan it starts is not cut short by
+                // stale names.
+                if (isScopeStart(item.record())) unfileDefinition(self, item.get());
+                takenOff.takeOff(item);
+                indices.append(i);
+            }
+            indices.sort();
+        } catch (...) {
+            takenOff.putBack();
+            throw;
+        }
     }
-    indices.sort();
 
     Py_ssize_t resume = -1;
     Py_ssize_t position = 0;

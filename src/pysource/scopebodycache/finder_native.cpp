@@ -46,6 +46,23 @@ void dropDefinitionIndex(PyObject* self) noexcept {
     delete index;
 }
 
+void stepCalledDirectly(PyObject* self) noexcept {
+    dropDefinitionIndex(self);
+    noteNamesWritten(finderState(self).logicalList);
+}
+
+void callStarts(PyObject* self) noexcept {
+    FinderState& s = finderState(self);
+    if (s.defIndex != nullptr && (s.defIndex->list() != s.logicalList || !s.defIndex->current())) {
+        dropDefinitionIndex(self);
+    }
+    if (s.defIndex != nullptr) {
+        s.defIndex->noteOwnWrites();
+    } else {
+        noteNamesWritten(s.logicalList);
+    }
+}
+
 DefIndex* definitionIndex(PyObject* self) {
     FinderState& s = finderState(self);
     NativePass* pass = s.native;

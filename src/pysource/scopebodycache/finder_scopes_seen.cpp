@@ -13,6 +13,24 @@ namespace sbc {
 
 using namespace contracts;
 
+// Whether `name` is the scope `prefix` or a scope nested in it: the prefix
+// must end at a separator, so that renaming f#1 leaves f#10 alone.
+bool inScope(PyObject* name, PyObject* prefix) {
+    if (compat::isStrExact(name) && compat::isStrExact(prefix)) {
+        const std::string_view whole = compat::strView(name);
+        const std::string_view head = compat::strView(prefix);
+        const size_t n = head.size();
+        return whole.size() >= n && std::memcmp(whole.data(), head.data(), n) == 0 &&
+               (whole.size() == n || whole[n] == '.');
+    }
+    py::Ref r = py::check(PyObject_CallMethodObjArgs(name, gNames.startswith, prefix, nullptr));
+    if (!py::truth(r.get())) return false;
+    const Py_ssize_t n = py::checkSize(PyObject_Size(prefix));
+    if (py::checkSize(PyObject_Size(name)) == n) return true;
+    py::Ref next = py::check(PySequence_GetItem(name, n));
+    return py::checkStatus(PyObject_RichCompareBool(next.get(), gNames.dot, Py_EQ)) != 0;
+}
+
 namespace {
 
 // `name` without its index suffix.
@@ -30,24 +48,6 @@ PyObject* requireTable(PyObject* self) {
     }
     if (s.scopesSeen == Py_None) msg::raise(PyExc_TypeError, msg::kNoneArgumentNotIterable);
     return s.scopesSeen;
-}
-
-// Whether `name` is the scope `prefix` or a scope nested in it: the prefix
-// must end at a separator, so that renaming f#1 leaves f#10 alone.
-bool inScope(PyObject* name, PyObject* prefix) {
-    if (compat::isStrExact(name) && compat::isStrExact(prefix)) {
-        const std::string_view whole = compat::strView(name);
-        const std::string_view head = compat::strView(prefix);
-        const size_t n = head.size();
-        return whole.size() >= n && std::memcmp(whole.data(), head.data(), n) == 0 &&
-               (whole.size() == n || whole[n] == '.');
-    }
-    py::Ref r = py::check(PyObject_CallMethodObjArgs(name, gNames.startswith, prefix, nullptr));
-    if (!py::truth(r.get())) return false;
-    const Py_ssize_t n = py::checkSize(PyObject_Size(prefix));
-    if (py::checkSize(PyObject_Size(name)) == n) return true;
-    py::Ref next = py::check(PySequence_GetItem(name, n));
-    return py::checkStatus(PyObject_RichCompareBool(next.get(), gNames.dot, Py_EQ)) != 0;
 }
 
 // new_prefix + name[len(old_prefix):], where name starts with old_prefix
@@ -107,7 +107,7 @@ void repairQueuedBefore(PyObject* self, Py_ssize_t end) {
     // A repair may drop the index (a name it cannot file): fetched afresh.
     while (DefIndex* index = definitionIndex(self)) {
         if (!index->popCandidate(end, &candidate)) return;
-        const Py_ssize_t position = index->positionOf(candidate.def.get());
+        const Py_ssize_t position = index->positionOf(candidate.def.get(), candidate.at);
         if (position < 0) continue;  // no longer filed
         DefinedName name;
         readDefinedName(candidate.def.get(), &name);

@@ -75,22 +75,23 @@ PyGetSetDef finder_getset[] = {
 
 // --- Python-visible methods -------------------------------------------------
 // A step called directly from Python may store any names: the definition
-// index cannot follow, and is rebuilt at the next call that needs it.
+// index cannot follow, and is rebuilt at the next call that needs it; so
+// are those of the list's other finders.
 
 PyObject* none() { return py::Ref::none().release(); }
 
 PyObject* m_destroy_impl(PyObject* self, PyObject* const*) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     finder::DestroyImpl(self);
     return none();
 }
 PyObject* m_Clear(PyObject* self, PyObject* const*) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     finder::Clear(self);
     return none();
 }
 PyObject* m_PrepareForFind(PyObject* self, PyObject* const*) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     finder::PrepareForFind(self);
     return none();
 }
@@ -98,37 +99,37 @@ PyObject* m_FindChanges(PyObject* self, PyObject* const* a) {
     return finder::FindChanges(self, a[0], a[1]).release();
 }
 PyObject* m_FindChangesEntireListAdded(PyObject* self, PyObject* const*) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     finder::FindChangesEntireListAdded(self);
     return none();
 }
 PyObject* m_GetLeafScopeWithIndex(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     return finder::GetLeafScopeWithIndex(self, a[0], py::asIndex(a[1])).release();
 }
 PyObject* m_ProcessRemovedLogicals(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     return finder::ProcessRemovedLogicals(self, a[0]).release();
 }
 PyObject* m_ProcessAddedLogicals(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     finder::ProcessAddedLogicals(self, a[0], a[1]);
     return none();
 }
 PyObject* m_ProcessDedentedComments(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     const Py_ssize_t first = py::asIndex(a[0]);
     const Py_ssize_t end = route::builtin<Step::ProcessDedentedComments>(finder::ProcessDedentedComments,
                                                                          self, first);
     return py::check(compat::intFromSsize(end)).release();
 }
 PyObject* m_LogicalInScopeChanged(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     finder::LogicalInScopeChanged(self, a[0], a[1], a[2] ? a[2] : Py_None, a[3] ? a[3] : Py_None);
     return none();
 }
 PyObject* m_SetLogicalScopeNames(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     py::Ref scope, local;
     unpackPair(a[2], &scope, &local);
     const bool changed =
@@ -136,30 +137,30 @@ PyObject* m_SetLogicalScopeNames(PyObject* self, PyObject* const* a) {
     return py::Ref::own(changed ? Py_True : Py_False).release();
 }
 PyObject* m_UpdateLogicalScopeName(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     return finder::UpdateLogicalScopeName(self, a[0], py::asIndex(a[1]), a[2]).release();
 }
 PyObject* m_UpdateContainingScope(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     finder::UpdateContainingScope(self, a[0], py::asIndex(a[1]), a[2]);
     return none();
 }
 PyObject* m_PropagateScopeIndexChangeForward(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     const Py_ssize_t start = py::asIndex(a[2]);
     const Py_ssize_t end = py::asIndex(a[3]);
     finder::PropagateScopeIndexChangeForward(self, a[0], a[1], start, end);
     return none();
 }
 PyObject* m_FindScopeIndexForLogical(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     const Py_ssize_t i = py::asIndex(a[1]);
     const Py_ssize_t index = route::builtin<Step::FindScopeIndexForLogical>(
         finder::FindScopeIndexForLogical, self, a[0], i);
     return py::check(compat::intFromSsize(index)).release();
 }
 PyObject* m_FindScopeNameContainingLogical(PyObject* self, PyObject* const* a) {
-    dropDefinitionIndex(self);
+    stepCalledDirectly(self);
     return finder::FindScopeNameContainingLogical(self, py::asIndex(a[0])).release();
 }
 

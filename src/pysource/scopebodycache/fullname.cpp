@@ -43,7 +43,12 @@ namespace {
 WatchedName gWatchedFullName;
 }  // namespace
 
+// Asked after nativeSiblingsCurrent, which follows the current module.
 bool fullNameFunctionCurrent() noexcept { return gWatchedFullName.holds(); }
+
+void watchFullNameIn(PyObject* moduleDict) noexcept {
+    gWatchedFullName.watch(moduleDict, gNames.GetFullNameForScopeDef, gFullNameFunction);
+}
 
 py::Ref callGetFullNameForScopeDef(PyObject* scopeDef, bool native) {
     if (native) return getFullNameForScopeDef(scopeDef);
@@ -57,7 +62,7 @@ void bindModuleFunctions(PyObject* moduleDict) {
     py::Ref f = newFunction(kFullNameSpec, kModuleName);
     py::checkStatus(PyDict_SetItemString(moduleDict, kFullNameSpec.name, f.get()));
     gFullNameFunction = f.release();
-    gWatchedFullName.watch(moduleDict, gNames.GetFullNameForScopeDef, gFullNameFunction);
+    watchFullNameIn(moduleDict);
 }
 
 }  // namespace sbc

@@ -13,9 +13,13 @@ py::Ref getFullNameForScopeDef(PyObject* scopeDef);
 py::Ref callGetFullNameForScopeDef(PyObject* scopeDef, bool native = false);
 
 // Whether the module global GetFullNameForScopeDef is still our own function.
-bool fullNameFunctionCurrent() noexcept;
+bool fullNameFunctionCurrent() noexcept;  // after nativeSiblingsCurrent
 
 // Binds GetFullNameForScopeDef in the module namespace.
 void bindModuleFunctions(PyObject* moduleDict);
+
+// Watches the global in another namespace of the module (see
+// followCurrentModule).
+void watchFullNameIn(PyObject* moduleDict) noexcept;
 
 }  // namespace sbc

@@ -123,6 +123,7 @@ void initialize(py::Ref& owner) {
     bindVariables();
     bindFunctions();
     moduleBody(dict);
+    holdModule(module);
 }
 
 // A traceback entry naming the init function, as for a Python frame.

@@ -16,6 +16,7 @@ void internNames() {
     gNames.star = intern("*");
     gNames.dot = intern(".");
     gNames.join = intern("join");
+    gNames.moduleName = intern(kModuleName);
     gNames.fastaccess = intern("_fastaccess");
     gNames.symbolinfo = intern("symbolinfo");
     gNames.GetFullNameForScopeDef = intern("GetFullNameForScopeDef");

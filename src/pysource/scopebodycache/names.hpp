@@ -18,6 +18,7 @@ struct Names {
     PyObject* star;   // "*"
     PyObject* dot;    // "."
     PyObject* join;
+    PyObject* moduleName;  // this module's dotted name, its key in sys.modules
     PyObject* fastaccess;
     PyObject* symbolinfo;
     PyObject* GetFullNameForScopeDef;

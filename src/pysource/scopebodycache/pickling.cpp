@@ -38,6 +38,16 @@ struct Field {
 
 constexpr int kMaxFields = 10;
 
+// A finder state taken while a call was in progress (from an override, or
+// after a direct _PrepareForFind) holds that call's sets and table: they
+// belong to the call, which goes on in the object they were taken from. A
+// finder loaded or copied from it comes back idle, so that its next call
+// works; only the finder running a call of its own keeps what it is given.
+void finderLoaded(PyObject* self) {
+    const FinderState& s = finderState(self);
+    if (!s.inCall && s.contentsChanges != Py_None) finder::Clear(self);
+}
+
 struct PickledClass {
     PyTypeObject* (*type)() noexcept;
     const Py_ssize_t* stateOffset;  // where the state block starts
@@ -45,6 +55,7 @@ struct PickledClass {
     const char* checksumMessage;  // one %zd: the checksum found in the pickle
     PyObject* Names::*rebuildName;
     void (*stateApplied)(PyObject* self) noexcept;  // internal state to reset
+    void (*stateLoaded)(PyObject* self);             // after every field is applied
     int fieldCount;
     Field fields[kMaxFields];
 };
@@ -81,6 +92,7 @@ const PickledClass kChangeFinder = {
     "Incompatible checksums (%zd vs 0x093a2af = (" SBC_BASE_FIELD_NAMES SBC_FINDER_FIELDS(SBC_FIELD_NAME_LIST) "))",
     &Names::unpickleChangeFinder,
     dropDefinitionIndex,  // rebuilt from the list when needed
+    finderLoaded,
     2 + 0 SBC_FINDER_FIELDS(SBC_COUNT_FIELD),
     {SBC_BASE_FIELDS SBC_FINDER_FIELDS(SBC_FINDER_FIELD)},
 };
@@ -92,6 +104,7 @@ const PickledClass kScopeBodyCache = {
     "Incompatible checksums (%zd vs 0xa66c71f = (" SBC_BASE_FIELD_NAMES SBC_BODY_CACHE_FIELDS(SBC_FIELD_NAME_LIST) "))",
     &Names::unpickleScopeBodyCache,
     dropBodyIndexes,
+    nullptr,
     2 + 0 SBC_BODY_CACHE_FIELDS(SBC_COUNT_FIELD),
     {SBC_BASE_FIELDS SBC_BODY_CACHE_FIELDS(SBC_BODY_CACHE_FIELD)},
 };
@@ -180,6 +193,7 @@ void applyState(const PickledClass& c, PyObject* self, PyObject* state) {
         py::Ref result = py::check(
             PyObject_CallMethodObjArgs(dict.get(), gNames.update, PyTuple_GET_ITEM(state, c.fieldCount), nullptr));
     }
+    if (c.stateLoaded != nullptr) c.stateLoaded(self);
 }
 
 void setState(const PickledClass& c, PyObject* self, PyObject* state) {

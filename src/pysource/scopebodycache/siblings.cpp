@@ -3,16 +3,21 @@
 #include "common/messages.hpp"
 #include "pysource/contracts/accessors.hpp"
 #include "pysource/contracts/sibling_types.hpp"
+#include "pysource/scopebodycache/fullname.hpp"
 #include "pysource/scopebodycache/names.hpp"
 
 #include <cstring>
+#include <vector>
 
 namespace sbc {
 
 PyObject* gTimeFunc = nullptr;
 PyTypeObject* gDestroyableType = nullptr;
 SymbolInfo gSymbolInfo;
+PyObject* gModule = nullptr;
 PyObject* gModuleDict = nullptr;
+PyObject* gWatchedModules = nullptr;
+WatchedName gWatchedModule;  // sys.modules[<name>] is gModule
 
 namespace {
 
@@ -237,15 +242,82 @@ void WatchedName::watch(PyObject* dict, PyObject* name, PyObject* expected) noex
     since_.watch(dict);
 }
 
-bool WatchedName::holds() noexcept {
+bool WatchedName::holdsAfterLookup() noexcept {
     if (dict_ == nullptr || expected_ == nullptr) return false;
-    if (since_.unchanged(dict_, name_, expected_)) return true;
     if (PyDict_GetItem(dict_, name_) != expected_) return false;
     since_.mark(dict_, name_);
     return true;
 }
 
+namespace {
+
+
+// `module.name` is the very function bound at import (borrowed lookups).
+bool holdsFunction(PyObject* module, PyObject* name, PyObject* function) {
+    return function != nullptr && moduleAttribute(module, name) == function;
+}
+
+// The siblings a new namespace binds, when they give the very functions
+// bound at import (the same extension's module objects made again), are
+// watched in place of the old ones: the native forms still stand for them.
+void rewatchSiblings(PyObject* dict) noexcept {
+    NativeSiblings& n = gNative;
+    PyObject* fastaccess = PyDict_GetItem(dict, gNames.fastaccess);
+    PyObject* symbolinfo = PyDict_GetItem(dict, gNames.symbolinfo);
+    if (fastaccess != nullptr && fastaccess != n.fastaccess && PyModule_Check(fastaccess) &&
+        holdsFunction(fastaccess, gNames.IndexForLineno, n.indexForLinenoFunction) &&
+        holdsFunction(fastaccess, gNames.FindIndexOfLogical, n.findIndexOfLogicalFunction)) {
+        py::Ref old = py::Ref::steal(n.fastaccess);  // released once nothing reads it
+        n.fastaccess = py::Ref::own(fastaccess).release();
+        gWatched[2].watch(PyModule_GetDict(fastaccess), gNames.IndexForLineno, n.indexForLinenoFunction);
+        gWatched[3].watch(PyModule_GetDict(fastaccess), gNames.FindIndexOfLogical, n.findIndexOfLogicalFunction);
+    }
+    if (symbolinfo != nullptr && symbolinfo != n.symbolinfo && PyModule_Check(symbolinfo) &&
+        holdsFunction(symbolinfo, gNames.LeafScopeNameHasIndex, n.leafScopeNameHasIndexFunction)) {
+        py::Ref old = py::Ref::steal(n.symbolinfo);
+        n.symbolinfo = py::Ref::own(symbolinfo).release();
+        gWatched[4].watch(PyModule_GetDict(symbolinfo), gNames.LeafScopeNameHasIndex,
+                          n.leafScopeNameHasIndexFunction);
+    }
+    gWatched[0].watch(dict, gNames.fastaccess, n.fastaccess);
+    gWatched[1].watch(dict, gNames.symbolinfo, n.symbolinfo);
+    watchFullNameIn(dict);
+}
+
+}  // namespace
+
+void holdModule(PyObject* module) {
+    gModule = py::Ref::own(module).release();
+    gModuleDict = PyModule_GetDict(module);
+    gWatchedModules = nullptr;  // watched at the first use
+}
+
+void followCurrentModuleAfterLookup() noexcept {
+    if (gModule == nullptr) return;  // during init
+    PyObject* modules = compat::modulesDict();
+    if (modules == nullptr) return;
+    PyObject* current = PyDict_GetItem(modules, gNames.moduleName);
+    if (current == gModule) {
+        gWatchedModules = modules;
+        gWatchedModule.watch(modules, gNames.moduleName, gModule);
+        gWatchedModule.holds();  // marks it
+        return;
+    }
+    if (current == nullptr || !PyModule_Check(current)) return;
+    // The one in use until now goes last, when every global points at the
+    // new one: its release may free it (2.7 then empties its namespace) and
+    // run finalizers, as any lookup of a global may.
+    py::Ref old = py::Ref::steal(gModule);
+    gModule = py::Ref::own(current).release();
+    gModuleDict = PyModule_GetDict(current);
+    rewatchSiblings(gModuleDict);
+    gWatchedModules = modules;
+    gWatchedModule.watch(modules, gNames.moduleName, gModule);
+    gWatchedModule.holds();
+}
+
 bool nativeSiblingsCurrent() noexcept {
+    followCurrentModule();
     const NativeSiblings& n = gNative;
     if (!n.indexForLineno || !n.findIndexOfLogical || !n.leafScopeNameHasIndex || !n.scopeNameSuffix) {
         return false;
@@ -257,6 +329,7 @@ bool nativeSiblingsCurrent() noexcept {
 }
 
 PyObject* lookupGlobal(PyObject* name) {
+    followCurrentModule();
     PyObject* v = PyDict_GetItem(gModuleDict, name);
     if (v == nullptr) v = PyDict_GetItem(PyEval_GetBuiltins(), name);
     if (v == nullptr) {

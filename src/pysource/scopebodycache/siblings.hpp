@@ -23,7 +23,22 @@ struct SymbolInfo {
 extern PyObject* gTimeFunc;         // __TimeFunc
 extern PyTypeObject* gDestroyableType;
 extern SymbolInfo gSymbolInfo;
-extern PyObject* gModuleDict;  // this module's namespace, for by-name lookups
+// The namespace the module looks its globals up in: that of the module
+// object callers now see. The module holds the module object it looks
+// names up in, so it is not freed (2.7 empties a module's namespace when it
+// frees it) while a finder may still use it.
+extern PyObject* gModule;      // owned
+extern PyObject* gModuleDict;  // its namespace, for by-name lookups
+// At the end of a successful init: the module object made there.
+void holdModule(PyObject* module);
+// The module found under this module's name in sys.modules, when it is not
+// the one names are looked up in, becomes that one: a second import (taken
+// out of sys.modules and imported again; on 3.12 on, also the first import
+// in the main interpreter after a subinterpreter's) makes a new module
+// object whose globals callers rebind. One absent from sys.modules (a
+// plugin reloader drops it) leaves the last one in use. Cheap when nothing
+// changed; may release nothing and runs no Python code.
+void followCurrentModuleAfterLookup() noexcept;
 
 // Import-time binding, in the order the init sequence needs it.
 void bindDestroyableBase();
@@ -74,14 +89,29 @@ class WatchedName {
 public:
     WatchedName() noexcept = default;
     void watch(PyObject* dict, PyObject* name, PyObject* expected) noexcept;
-    bool holds() noexcept;
+    // Asked at every call: the unchanged case inline.
+    bool holds() noexcept {
+        if (dict_ != nullptr && expected_ != nullptr && since_.unchanged(dict_, name_, expected_)) return true;
+        return holdsAfterLookup();
+    }
 
 private:
+    bool holdsAfterLookup() noexcept;
     PyObject* dict_ = nullptr;      // borrowed: module dicts live as long as the process here
     PyObject* name_ = nullptr;      // an interned str
     PyObject* expected_ = nullptr;  // borrowed from what keeps it (the import-time snapshot)
     compat::DictWatch since_;       // marked at the last lookup that found expected_
 };
+
+// sys.modules still maps this module's name to the module in use: the
+// cheap part of followCurrentModule, asked at every call.
+extern PyObject* gWatchedModules;  // the sys.modules watched (compared only)
+extern WatchedName gWatchedModule;
+
+inline void followCurrentModule() noexcept {
+    if (gWatchedModules != nullptr && compat::modulesDict() == gWatchedModules && gWatchedModule.holds()) return;
+    followCurrentModuleAfterLookup();
+}
 
 // Calls of the siblings' Python-level functions, looked up by name through
 // the module globals `_fastaccess` and `symbolinfo` at each call; with

@@ -3,6 +3,7 @@
 #include "pysource/scopebodycache/utilities.hpp"
 
 #include "pysource/contracts/accessors.hpp"
+#include "pysource/scopebodycache/def_index.hpp"
 #include "pysource/scopebodycache/function.hpp"
 #include "pysource/scopebodycache/names.hpp"
 #include "pysource/scopebodycache/report.hpp"
@@ -28,10 +29,14 @@ char getInfoBytesKind(PyObject* ibytes) noexcept {
     return neverRaises("pysource.symbolinfo.GetInfoBytesKind", char(0), [ibytes] {
         if (ibytes == Py_None) msg::raise(PyExc_TypeError, msg::kNoneHasNoLen);
         // By characters: a kind read from a 2.7 pickle (latin-1) is the same.
+        // A kind is one byte: a character above U+00FF is none, and the
+        // string reads as plain, never as the kind of its low byte.
         if (compat::strLength(ibytes) < 2 || compat::strCharAt(ibytes, 0) != ':') {
             return gSymbolInfo.kPlainEquivKind;
         }
-        return compat::strCharAt(ibytes, 1);
+        const uint32_t kind = compat::strCharAt(ibytes, 1);
+        if (kind > 0xFF) return gSymbolInfo.kPlainEquivKind;
+        return static_cast<char>(kind);
     });
 }
 
@@ -84,6 +89,7 @@ PyObject* py_GetLocalScopeDefined(PyObject*, PyObject* const* a) {
 
 PyObject* py_SetLogicalLocalScopeDefined(PyObject*, PyObject* const* a) {
     setLocalScopeDefined(requireLogical(a[0]), a[1]);
+    noteStrayNamesWritten();  // of a list no one can tell
     return py::Ref::none().release();
 }
 
