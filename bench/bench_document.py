@@ -10,7 +10,10 @@ Files: ftplib.py (~1k lines), decimal.py on 2.7 / _pydecimal.py on 3.x
 the running interpreter. Edits, each made at many places of the file and
 undone again (the undo is an edit of the same size):
 
-  typed char   a character typed after the first name of a body line;
+  typed char   a character typed after the first name of a body line
+               (and deleted), then the same at the next place;
+  typing       ten characters typed there one by one, then deleted one
+               by one (two at the slow pipelines): one cursor at work;
   Enter        Enter at the end of a body line (its indentation typed too);
   Backspace    Backspace at the start of a body line, joining it to the
                line above;
@@ -73,7 +76,7 @@ except ImportError:
 kPy2 = sys.version_info[0] == 2
 kParsoPython = '/usr/bin/python3'
 kHere = os.path.dirname(os.path.abspath(__file__))
-kKinds = ('typed char', 'Enter', 'Backspace', 'def line', 'paste 20', 'open """', 'close """',
+kKinds = ('typed char', 'typing', 'Enter', 'Backspace', 'def line', 'paste 20', 'open """', 'close """',
           'open (', 'close )')
 # Kinds timed call by call (each takes long enough for the clock); the
 # closing ones are made by the stream of the opening one.
@@ -82,7 +85,7 @@ kClosing = ('close """', 'close )')
 
 # (kind, size label) -> target text; a size of None: every size.
 kTargets = {
-    ('typed char', None): '<= 5 us',
+    ('typed char', None): '<= 5 us', ('typing', None): '<= 5 us',
     ('Enter', '10k'): '<= 30 us', ('Enter', '100k'): '<= 250 us',
     ('Backspace', '10k'): '<= 30 us', ('Backspace', '100k'): '<= 250 us',
     ('def line', '10k'): '<= 30 us', ('def line', '100k'): '<= 250 us',
@@ -200,10 +203,16 @@ def Spread_(items, count, rng):
     return [items[int(k * step + rng.random() * step)] for k in range(count)]
 
 
-def Stream(kind, places, count, rng):
+def Stream(kind, places, count, rng, run=10):
     lines = places.lines
     out = []
-    if kind == 'typed char':
+    if kind == 'typing':
+        for l in Spread_(places.Body(), count, rng):
+            col = l.fIndent + len(l.fTokens[0])
+            out += [(kind, (l.fLineno, col + k, l.fLineno, col + k, 'x')) for k in range(run)]
+            out += [(kind, (l.fLineno, col + k - 1, l.fLineno, col + k, ''))
+                    for k in range(run, 0, -1)]
+    elif kind == 'typed char':
         for l in Spread_(places.Body(), count, rng):
             col = l.fIndent + len(l.fTokens[0])
             out += [(kind, (l.fLineno, col, l.fLineno, col, 'x')),
@@ -457,7 +466,7 @@ def main(argv=None):
                            for k in kKinds if k not in kClosing)
             streams.update((k, []) for k in kClosing)
             native[size] = BenchDocument(CScopeDocument, text, streams, args.batches, False)
-        streams = dict((k, Stream(k, places, slow, rng)) for k in kKinds if k not in kClosing)
+        streams = dict((k, Stream(k, places, slow, rng, run=2)) for k in kKinds if k not in kClosing)
         streams.update((k, []) for k in kClosing)
         if args.reference:
             reference[size] = BenchDocument(CReferenceDocument, text, streams, 1, True)
