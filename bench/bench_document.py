@@ -10,15 +10,21 @@ Files: ftplib.py (~1k lines), decimal.py on 2.7 / _pydecimal.py on 3.x
 the running interpreter. Edits, each made at many places of the file and
 undone again (the undo is an edit of the same size):
 
-  typed char   a character typed after the first name of a body line;
+  typed char   a character typed after the first name of a body line
+               (and deleted), then the same at the next place;
+  typing       ten characters typed there one by one, then deleted one
+               by one (two at the slow pipelines): one cursor at work;
   Enter        Enter at the end of a body line (its indentation typed too);
   Backspace    Backspace at the start of a body line, joining it to the
                line above;
   def line     a method header typed in above a method;
   paste 20     20 lines (whole statements of the file) pasted in place;
   open/close   `\"\"\"` typed at the start of a top-level line near the top,
-               which turns the rest of the file inside out, then the
-               closing `\"\"\"` typed right after it (then both removed).
+               which turns the rest of the file inside out (the reader
+               then stops at the first line that does not read), then the
+               closing `\"\"\"` typed right after it (then both removed);
+  open/close ( the same with `(` and `)`: until the `)` the rest of the
+               file is one statement, which fails only at the end.
 
 Pipelines, side by side in one run:
 
@@ -70,13 +76,16 @@ except ImportError:
 kPy2 = sys.version_info[0] == 2
 kParsoPython = '/usr/bin/python3'
 kHere = os.path.dirname(os.path.abspath(__file__))
-kKinds = ('typed char', 'Enter', 'Backspace', 'def line', 'paste 20', 'open """', 'close """')
-# Kinds timed call by call (each takes long enough for the clock).
-kEachTimed = ('open """', 'close """')
+kKinds = ('typed char', 'typing', 'Enter', 'Backspace', 'def line', 'paste 20', 'open """', 'close """',
+          'open (', 'close )')
+# Kinds timed call by call (each takes long enough for the clock); the
+# closing ones are made by the stream of the opening one.
+kEachTimed = ('open """', 'close """', 'open (', 'close )')
+kClosing = ('close """', 'close )')
 
 # (kind, size label) -> target text; a size of None: every size.
 kTargets = {
-    ('typed char', None): '<= 5 us',
+    ('typed char', None): '<= 5 us', ('typing', None): '<= 5 us',
     ('Enter', '10k'): '<= 30 us', ('Enter', '100k'): '<= 250 us',
     ('Backspace', '10k'): '<= 30 us', ('Backspace', '100k'): '<= 250 us',
     ('def line', '10k'): '<= 30 us', ('def line', '100k'): '<= 250 us',
@@ -194,10 +203,16 @@ def Spread_(items, count, rng):
     return [items[int(k * step + rng.random() * step)] for k in range(count)]
 
 
-def Stream(kind, places, count, rng):
+def Stream(kind, places, count, rng, run=10):
     lines = places.lines
     out = []
-    if kind == 'typed char':
+    if kind == 'typing':
+        for l in Spread_(places.Body(), count, rng):
+            col = l.fIndent + len(l.fTokens[0])
+            out += [(kind, (l.fLineno, col + k, l.fLineno, col + k, 'x')) for k in range(run)]
+            out += [(kind, (l.fLineno, col + k - 1, l.fLineno, col + k, ''))
+                    for k in range(run, 0, -1)]
+    elif kind == 'typed char':
         for l in Spread_(places.Body(), count, rng):
             col = l.fIndent + len(l.fTokens[0])
             out += [(kind, (l.fLineno, col, l.fLineno, col, 'x')),
@@ -221,11 +236,16 @@ def Stream(kind, places, count, rng):
             n = l.fLineno
             block = '\n'.join(lines[n - 1:n + 19]) + '\n'
             out += [(kind, (n, 0, n, 0, block)), (kind, (n, 0, n + 20, 0, ''))]
-    else:
+    elif kind == 'open """':
         n = places.TopLine()
         for _ in range(count):
             out += [('open """', (n, 0, n, 0, '"""')), ('close """', (n, 3, n, 3, '"""')),
                     (None, (n, 0, n, 6, ''))]
+    elif kind == 'open (':
+        n = places.TopLine()
+        for _ in range(count):
+            out += [('open (', (n, 0, n, 0, '(')), ('close )', (n, 1, n, 1, ')')),
+                    (None, (n, 0, n, 2, ''))]
     return out
 
 
@@ -255,7 +275,7 @@ def TimeStreams(doc, stream, batches, each):
 
 
 def CheckReadable(result, label):
-    if not result.fReadable and label != 'open """':
+    if not result.fReadable and label not in ('open """', 'open ('):
         raise SystemExit('the benchmark\'s edit %s left text that does not read: %r' % (
             label, result.fError))
 
@@ -297,7 +317,7 @@ def BenchParso(text, streams_by_kind):
     with os.fdopen(handle, 'wb') as f:
         f.write(text if kPy2 else text.encode('utf-8'))
     streams = []
-    for kind in kKinds[:-1]:
+    for kind in kKinds:
         streams.append([(label, list(args)) for label, args in streams_by_kind[kind]])
     job = dict(text=text_path, encoding='latin-1' if kPy2 else 'utf-8', streams=streams)
     handle, job_path = tempfile.mkstemp(suffix='.json')
@@ -443,11 +463,11 @@ def main(argv=None):
         slow = {'1k': 6, '10k': 3, '100k': 2}.get(size, 2)
         if CScopeDocument is not None:
             streams = dict((k, Stream(k, places, args.positions if k not in kEachTimed else 10, rng))
-                           for k in kKinds[:-1])
-            streams['close """'] = []
+                           for k in kKinds if k not in kClosing)
+            streams.update((k, []) for k in kClosing)
             native[size] = BenchDocument(CScopeDocument, text, streams, args.batches, False)
-        streams = dict((k, Stream(k, places, slow, rng)) for k in kKinds[:-1])
-        streams['close """'] = []
+        streams = dict((k, Stream(k, places, slow, rng, run=2)) for k in kKinds if k not in kClosing)
+        streams.update((k, []) for k in kClosing)
         if args.reference:
             reference[size] = BenchDocument(CReferenceDocument, text, streams, 1, True)
             if has_native_reader:
@@ -462,7 +482,7 @@ def main(argv=None):
     print('Python %d.%d; files: %s' % (sys.version_info[:2] + (', '.join(
         '%s %s' % (s, n) for s, n, _ in files),)))
     if CScopeDocument is not None:
-        PrintTable('CScopeDocument (%d places per edit, %d batches; open/close """ at 10 places, '
+        PrintTable('CScopeDocument (%d places per edit, %d batches; the opening and closing ones 10 times, '
                    'each call timed):' % (args.positions, args.batches), 'us', sizes, native,
                    line_counts, True)
     else:
