@@ -23,23 +23,13 @@ from __future__ import print_function
 
 import argparse
 import os
-import subprocess
 import sys
 
 import benchkit
+from toolpath import PyenvRoot
 from benchkit import CChangeFinder, Clock, FormatSpread, LogicalLineType, ReadLogicals
 
 from pysource import _reader, logicals
-
-
-def PyenvRoot():
-    root = os.environ.get('PYENV_ROOT')
-    if root:
-        return root
-    try:
-        return subprocess.check_output(['pyenv', 'root']).decode().strip()
-    except (OSError, subprocess.CalledProcessError):
-        return os.path.expanduser('~/.pyenv')
 
 
 def DefaultRoot():

@@ -38,6 +38,8 @@ import subprocess
 import sys
 import tempfile
 
+from toolpath import PyenvRoot
+
 kToolsDir = os.path.dirname(os.path.abspath(__file__))
 kPythonDir = os.path.join(os.path.dirname(kToolsDir), 'python')
 
@@ -194,16 +196,6 @@ def _ErrorText(error):
 
 
 # --- Driver --------------------------------------------------------------------
-
-def PyenvRoot():
-    root = os.environ.get('PYENV_ROOT')
-    if root:
-        return root
-    try:
-        return subprocess.check_output(['pyenv', 'root']).decode().strip()
-    except (OSError, subprocess.CalledProcessError):
-        return os.path.expanduser('~/.pyenv')
-
 
 def Interpreter(given):
     """The interpreter to run: `given` itself, or the pyenv install of version `given`."""

@@ -2,6 +2,7 @@
 
 import errno
 import os
+import subprocess
 import sys
 
 kToolsDir = os.path.dirname(os.path.abspath(__file__))
@@ -52,6 +53,17 @@ def ReadSource(path):
     if text.startswith(u'\ufeff'):
         text = text[1:]
     return text.replace(u'\r\n', u'\n').replace(u'\r', u'\n')
+
+
+def PyenvRoot():
+    """Where pyenv keeps its interpreters."""
+    root = os.environ.get('PYENV_ROOT')
+    if root:
+        return root
+    try:
+        return subprocess.check_output(['pyenv', 'root']).decode().strip()
+    except (OSError, subprocess.CalledProcessError):
+        return os.path.expanduser('~/.pyenv')
 
 
 def StdlibDir():

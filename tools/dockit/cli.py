@@ -14,7 +14,7 @@ from progress import Progress
 from dockit.checks import Session
 from dockit.makers import TextEditMaker
 from dockit.repro import DocumentClass, WriteReproducer, kDefaultReproDir
-from replaykit.cli import SampleFiles, SeededRandom, StdlibFiles, _Percentile, _Short
+from replaykit.cli import ByKind, SampleFiles, SeededRandom, StdlibFiles, _Short
 
 kSamplePath = os.path.join(toolpath.kRepoDir, 'samples', 'outline_sample.py')
 
@@ -136,9 +136,7 @@ def RunReplay(paths, document='native', seed=0, edits_per_file=150, reset_every=
         if stop_on_failure and file_fails:
             break
     progress.Close()
-    summary['by_kind'] = dict(
-        (k, (len(v), _Percentile(sorted(v), 0.5), _Percentile(sorted(v), 0.95)))
-        for k, v in times_by_kind.items())
+    summary['by_kind'] = ByKind(times_by_kind)
     return summary
 
 

@@ -53,6 +53,12 @@ def SampleFiles(paths, count, seed, max_lines=None):
     return [p for i, p in enumerate(paths) if i in picked]
 
 
+def ByKind(times_by_kind):
+    """{kind: (count, median, p95)} of the times recorded by kind."""
+    return dict((k, (len(v), _Percentile(sorted(v), 0.5), _Percentile(sorted(v), 0.95)))
+                for k, v in times_by_kind.items())
+
+
 def _Short(path):
     if path.startswith(kStdlibDir):
         return 'stdlib' + path[len(kStdlibDir):]
@@ -182,9 +188,7 @@ def RunReplay(paths, seed=0, edits_per_file=150, batch_fraction=0.15, cache_chec
     summary['findchanges_us_p95'] = _Percentile(times, 0.95)
     summary['logicals_per_file_median'] = _Percentile(sizes, 0.5)
     summary['logicals_per_file_max'] = sizes[-1] if sizes else 0
-    summary['by_kind'] = dict(
-        (k, (len(v), _Percentile(sorted(v), 0.5), _Percentile(sorted(v), 0.95)))
-        for k, v in times_by_kind.items())
+    summary['by_kind'] = ByKind(times_by_kind)
     return summary
 
 
