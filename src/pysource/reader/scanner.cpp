@@ -504,21 +504,13 @@ bool Scanner<Char>::scanRow() {
                         p = tail;
                         continue;
                     }
-                    string_ = kind;
-                    strBegin_ = rowStart + q;
-                    strRowStart_ = rowStart;
-                    strLineno_ = lnum;
-                    strColumn_ = q;
+                    openString(kind, rowStart, lnum, q);
                     return true;
                 }
                 const OneLine one = matchOneLineString(line, i, max, &e);
                 if (one == OneLine::kContinued) {
-                    string_ = quote == '\'' ? kSingleQuote : kDoubleQuote;
+                    openString(quote == '\'' ? kSingleQuote : kDoubleQuote, rowStart, lnum, q);
                     needcont_ = true;
-                    strBegin_ = rowStart + q;
-                    strRowStart_ = rowStart;
-                    strLineno_ = lnum;
-                    strColumn_ = q;
                     return true;
                 }
                 if (one == OneLine::kNone) e = kNoMatch;

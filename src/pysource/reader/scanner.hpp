@@ -159,6 +159,14 @@ private:
     void endStatement();
     void addBlank(int64_t lineno, const Char* row, size_t column);
     void failAtEof(ErrorKind kind, int64_t lineno, int64_t offset);
+    // A string that runs past its row, from column `column` of row `lineno`.
+    void openString(uint8_t kind, size_t rowStart, int64_t lineno, size_t column) {
+        string_ = kind;
+        strBegin_ = rowStart + column;
+        strRowStart_ = rowStart;
+        strLineno_ = lineno;
+        strColumn_ = column;
+    }
     uint8_t kindOfPending() const;
     bool spanIs(const TokenSpan& span, const char* word, size_t n) const;
 
