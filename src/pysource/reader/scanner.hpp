@@ -126,6 +126,12 @@ public:
     // vectors are cleared.
     void start(int64_t lineno, size_t offset, LineState entry, const int64_t* indents, size_t indentCount);
 
+    // The text a following start() reads from (a longer copy of it, say).
+    void retarget(const Char* text, size_t length) {
+        text_ = text;
+        length_ = length;
+    }
+
     // Reads one row. False when no row is left, when a whitespace-only last
     // row ended the text, or when an error stopped the scan (error()).
     bool scanRow();

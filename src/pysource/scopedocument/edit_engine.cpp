@@ -286,19 +286,9 @@ py::Ref setText(Document& d, PyObject* source) {
     requireEditText(source);
     const compat::CharsView chars = compat::strChars(source);
     const size_t n = static_cast<size_t>(chars.length);
-    auto charAt = [&](size_t i) -> uint32_t {
-        switch (chars.width) {
-        case 1: return static_cast<const uint8_t*>(chars.data)[i];
-        case 2: return static_cast<const uint16_t*>(chars.data)[i];
-        default: return static_cast<const uint32_t*>(chars.data)[i];
-        }
-    };
     const size_t old = d.text.size();
-    const size_t limit = std::min(old, n);
-    size_t head = 0;
-    while (head < limit && d.text.at(head) == charAt(head)) ++head;
-    size_t tail = 0;
-    while (tail < limit - head && d.text.at(old - 1 - tail) == charAt(n - 1 - tail)) ++tail;
+    const size_t head = d.text.commonPrefix(chars.data, chars.width, n);
+    const size_t tail = d.text.commonSuffix(chars.data, chars.width, n, head);
     // The one edit, in lines and columns of the current text.
     const size_t startRow = rowOfOffset(d, head) - 1;
     const size_t endRow = rowOfOffset(d, old - tail) - 1;

@@ -19,6 +19,13 @@ void initialize(py::Ref& owner) {
     compat::setPackage(dict, "pysource");
     const char* check = std::getenv("SBC_CHECK_DOCUMENT");
     gCheckEveryEdit = check != nullptr && check[0] == '1';
+    // "CHARS,ROWS": the size of the text's and the row table's chunks.
+    if (const char* chunks = std::getenv("SBC_DOCUMENT_CHUNKS")) {
+        char* rest = nullptr;
+        const unsigned long chars = std::strtoul(chunks, &rest, 10);
+        const unsigned long rows = *rest == ',' ? std::strtoul(rest + 1, nullptr, 10) : 0;
+        if (chars > 0 && rows > 0) setChunkSizes(chars, rows);
+    }
     bindImports();
     readyDocumentType();
     readyEditResultType();

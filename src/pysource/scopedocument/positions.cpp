@@ -48,17 +48,7 @@ size_t rowLength(const Document& d, size_t r) {
     return next - start;
 }
 
-size_t rowOfOffset(const Document& d, size_t at) {
-    // The last row starting at or before `at`.
-    size_t lo = 0, hi = d.rows.count();
-    const size_t n = d.text.size();
-    while (hi - lo > 1) {
-        const size_t mid = lo + (hi - lo) / 2;
-        if (d.rows.start(mid, n) <= at) lo = mid;
-        else hi = mid;
-    }
-    return lo + 1;
-}
+size_t rowOfOffset(const Document& d, size_t at) { return d.rows.rowAt(at) + 1; }
 
 size_t offsetOf(Document& d, PyObject* linenoArg, PyObject* columnArg, bool utf16, const char* which, size_t* row) {
     const Py_ssize_t lineno = intArgument(linenoArg, which, "line");

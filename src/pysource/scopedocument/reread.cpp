@@ -41,19 +41,44 @@ using reader::Scanner;
 
 namespace {
 
-static_assert(sizeof(LineState) == sizeof(RowState), "a row keeps the scanner's state as it is");
+// A row keeps the state in 32 bits: the string kind in 3 bits, the three
+// flags, and the bracket depth in the other 26. A depth past that (tens of
+// millions of unclosed or stray brackets) is kept as kEscaped, which no
+// read starts from and no read converges on: such rows are read again.
+constexpr uint32_t kEscaped = 7;
+constexpr int32_t kDepthLimit = 1 << 25;
 
 RowState pack(const LineState& s) noexcept {
     RowState r;
-    std::memcpy(&r.bits, &s, sizeof s);
+    if (s.depth >= kDepthLimit || s.depth < -kDepthLimit) {
+        r.bits = kEscaped;
+        return r;
+    }
+    r.bits = uint32_t{s.string} | uint32_t{s.needcont} << 3 | uint32_t{s.cont} << 4 | uint32_t{s.open} << 5 |
+             static_cast<uint32_t>(s.depth) << 6;
     return r;
 }
 
+// A whole read leaves a copy of the text behind; it goes when the read does.
+struct CopyReleased {
+    TextStore& text;
+    ~CopyReleased() { text.releaseCopy(); }
+};
+
+bool escaped(const RowState& r) noexcept { return (r.bits & 7u) == kEscaped; }
+
 LineState unpack(const RowState& r) noexcept {
     LineState s;
-    std::memcpy(static_cast<void*>(&s), &r.bits, sizeof s);
+    s.string = static_cast<uint8_t>(r.bits & 7u);
+    s.needcont = static_cast<uint8_t>(r.bits >> 3 & 1u);
+    s.cont = static_cast<uint8_t>(r.bits >> 4 & 1u);
+    s.open = static_cast<uint8_t>(r.bits >> 5 & 1u);
+    s.depth = static_cast<int32_t>(r.bits) >> 6;
     return s;
 }
+
+// A read may start at a row whose state continues no logical.
+bool startsClean(const RowState& r) noexcept { return !escaped(r) && !unpack(r).midLogical(); }
 
 int16_t columnOf(int64_t c) noexcept {
     if (c < 0) return kNoIndentCheck;
@@ -167,7 +192,7 @@ py::Ref eofError(Document& d, const reader::ScanError& error) {
         }
         return makeError(d, error.kind, error.lineno, error.offset, std::move(text));
     }
-    const Char* p = static_cast<const Char*>(d.text.contiguousFrom(bom));
+    const Char* p = static_cast<const Char*>(d.text.contiguous(bom, d.text.size()));
     size_t begin = 0, end = 0;
     py::Ref text;
     if (reader::splitLine(p, d.text.size() - bom, error.lineno, &begin, &end)) {
@@ -311,7 +336,7 @@ template <class Char>
 py::Ref readWholeAs(Document& d) {
     const size_t bom = bomLength(d);
     const size_t length = d.text.size() - bom;
-    const Char* p = static_cast<const Char*>(d.text.contiguousFrom(bom));
+    const Char* p = static_cast<const Char*>(d.text.contiguous(bom, d.text.size()));
     Scanner<Char> scanner(p, length);
     const size_t count = d.rows.count();
     size_t row = 0;
@@ -328,8 +353,6 @@ py::Ref readWholeAs(Document& d) {
         setUnreadable(d, scanError(d, scanner, bom));
         return py::Ref();
     }
-    // The text may have moved: the scanner's spans are offsets from `bom`.
-    p = static_cast<const Char*>(d.text.contiguousFrom(bom));
     return makeLogicals(scanner, p, d);
 }
 
@@ -370,7 +393,7 @@ void rereadAs(Document& d, EditOutcome& out) {
         afterRow[k] = (known ? ranges[k].endRow : rowOfOffset(d, ranges[k].end) - 1) + 1;
     }
     auto cleanAbove = [&](size_t r) {
-        while (r > 0 && unpack(d.rows.state(r)).midLogical()) --r;
+        while (r > 0 && !startsClean(d.rows.state(r))) --r;
         return r;
     };
     auto region = [&](const std::vector<GroupRead>& groups) {
@@ -403,33 +426,49 @@ void rereadAs(Document& d, EditOutcome& out) {
             sameRows = sameRows && ranges[k].lineDelta == 0 && ranges[k].rowsDropped == 0;
             droppedLeast = std::min(droppedLeast, ranges[k].droppedMinColumn);
         };
-        takeIn(j);
         const size_t base = d.rows.start(G.first, n) + (G.first == 0 ? bomLength(d) : 0);
-        const Char* p = static_cast<const Char*>(d.text.contiguousFrom(base));
-        Scanner<Char> scanner(p, n - base);
+        // The scanner reads a window of whole rows, in place when one chunk
+        // of the text holds it. The rows in a window read as they do in the
+        // whole text, but its end is no end: a read that runs out of its
+        // window goes on in one four times as large, from the same base, so
+        // that what it has read stays valid.
+        size_t windowRows = 16 + 2 * (afterRow[j] - G.first);
+        auto windowEnd = [&] { return G.first + windowRows >= count ? n : d.rows.start(G.first + windowRows, n); };
+        size_t end = windowEnd();
+        const Char* p = static_cast<const Char*>(d.text.contiguous(base, end));
+        Scanner<Char> scanner(p, end - base);
         scanner.start(static_cast<int64_t>(G.first) + 1, 0, unpack(d.rows.state(G.first)), G.stack.data(),
                       G.stack.size());
+        takeIn(j);
         size_t row = G.first;
-        while (scanner.scanRow()) {
-            G.columns.push_back(columnOf(scanner.rowIndentColumn()));
-            ++row;
-            const LineState s = scanner.state();
-            G.states.push_back(pack(s));
-            // A range that starts in a row read joins this read.
-            while (last + 1 < rangeCount && row > startRow[last + 1]) {
-                takeIn(++last);
-                comparable = afterRow[last];
+        for (;;) {
+            while (scanner.scanRow()) {
+                G.columns.push_back(columnOf(scanner.rowIndentColumn()));
+                ++row;
+                const LineState s = scanner.state();
+                G.states.push_back(pack(s));
+                // A range that starts in a row read joins this read.
+                while (last + 1 < rangeCount && row > startRow[last + 1]) {
+                    takeIn(++last);
+                    comparable = afterRow[last];
+                }
+                if (row >= comparable && row < count && !s.midLogical() && pack(s) == d.rows.state(row) &&
+                    !escaped(d.rows.state(row))) {
+                    G.converged = true;
+                    break;
+                }
+                // So does one that starts in the next row, unless the read
+                // stops above it.
+                while (last + 1 < rangeCount && row >= startRow[last + 1]) {
+                    takeIn(++last);
+                    comparable = afterRow[last];
+                }
             }
-            if (row >= comparable && row < count && !s.midLogical() && pack(s) == d.rows.state(row)) {
-                G.converged = true;
-                break;
-            }
-            // So does one that starts in the next row, unless the read stops
-            // above it.
-            while (last + 1 < rangeCount && row >= startRow[last + 1]) {
-                takeIn(++last);
-                comparable = afterRow[last];
-            }
+            if (G.converged || scanner.error() || end == n) break;
+            windowRows *= 4;
+            end = windowEnd();
+            p = static_cast<const Char*>(d.text.contiguous(base, end));
+            scanner.retarget(p, end - base);
         }
         G.stopped = !G.converged && !scanner.error() && scanner.atEnd() && row < count && d.rows.start(row, n) < n;
         d.stats.rowsScanned += row - G.first + (G.stopped ? 1 : 0);
@@ -457,8 +496,7 @@ void rereadAs(Document& d, EditOutcome& out) {
             }
             if (!sameColumns) pending = std::min(pending, std::min(least, leastOld));
         }
-        // Made now: the next group's read moves the text.
-        p = static_cast<const Char*>(d.text.contiguousFrom(base));
+        // Made now: the next group's read may reuse the copy.
         G.fresh = makeLogicals(scanner, p, d);
         j = last + 1;
         if (G.converged && pending != INT64_MAX) {
@@ -572,7 +610,7 @@ void rereadAs(Document& d, EditOutcome& out) {
 template <class Char>
 std::string checkRowsAs(Document& d) {
     const size_t bom = bomLength(d);
-    const Char* p = static_cast<const Char*>(d.text.contiguousFrom(bom));
+    const Char* p = static_cast<const Char*>(d.text.contiguous(bom, d.text.size()));
     Scanner<Char> scanner(p, d.text.size() - bom);
     const size_t count = d.rows.count();
     size_t row = 0;
@@ -655,6 +693,7 @@ std::string checkBaselineRows(Document& d, PyObject* baseline) {
 }
 
 std::string checkRowStates(Document& d) {
+    CopyReleased release{d.text};
     switch (d.text.width()) {
     case 1: return checkRowsAs<uint8_t>(d);
     case 2: if constexpr (compat::kPython3) return checkRowsAs<uint16_t>(d); break;
@@ -670,6 +709,7 @@ size_t bomLength(const Document& d) {
 }
 
 py::Ref readWhole(Document& d) {
+    CopyReleased release{d.text};
     switch (d.text.width()) {
     case 1: return readWholeAs<uint8_t>(d);
     case 2: if constexpr (compat::kPython3) return readWholeAs<uint16_t>(d); break;
@@ -679,6 +719,7 @@ py::Ref readWhole(Document& d) {
 }
 
 void reread(Document& d, EditOutcome& out) {
+    CopyReleased release{d.text};
     switch (d.text.width()) {
     case 1: return rereadAs<uint8_t>(d, out);
     case 2: if constexpr (compat::kPython3) return rereadAs<uint16_t>(d, out); break;

@@ -10,7 +10,22 @@ namespace sdoc {
 
 namespace {
 
-inline uint32_t charAt(const void* data, int width, size_t i) noexcept {
+// Chunks are cut near gChunkChars; one that grows past gMaxChunkChars is
+// cut again, one that shrinks below gMinChunkChars joins a neighbour. An
+// edit inside a chunk moves at most gMaxChunkChars characters, and at 100k
+// lines there are a few hundred chunk starts to shift. Rows likewise. Tests
+// make the chunks tiny, so that every edit meets their edges.
+size_t gChunkChars = 8192;
+size_t gMaxChunkChars = 16384;
+size_t gMinChunkChars = 1024;
+size_t gChunkRows = 512;
+size_t gMaxChunkRows = 1024;
+size_t gMinChunkRows = 64;
+
+// A chunk's rows start within 64K characters of its base.
+constexpr size_t kMaxOffset = std::numeric_limits<uint16_t>::max();
+
+inline uint32_t charOf(const void* data, int width, size_t i) noexcept {
     switch (width) {
     case 1: return static_cast<const uint8_t*>(data)[i];
     case 2: return static_cast<const uint16_t*>(data)[i];
@@ -18,10 +33,34 @@ inline uint32_t charAt(const void* data, int width, size_t i) noexcept {
     }
 }
 
+inline void storeChar(uint8_t* p, int width, size_t i, uint32_t c) noexcept {
+    switch (width) {
+    case 1: p[i] = static_cast<uint8_t>(c); break;
+    case 2: reinterpret_cast<uint16_t*>(p)[i] = static_cast<uint16_t>(c); break;
+    default: reinterpret_cast<uint32_t*>(p)[i] = c; break;
+    }
+}
+
+// `n` characters of width `from` at `src` written at `dst` in width `to`.
+void put(uint8_t* dst, int to, const void* src, int from, size_t n) noexcept {
+    if (to == from) {
+        if (n) std::memcpy(dst, src, n * static_cast<size_t>(to));
+        return;
+    }
+    for (size_t i = 0; i < n; ++i) storeChar(dst, to, i, charOf(src, from, i));
+}
+
 // The width a character needs.
 inline int widthOf(uint32_t c) noexcept { return c < 0x100 ? 1 : c < 0x10000 ? 2 : 4; }
 
-// Offsets are kept in 32 bits; a text must fit them.
+int widestIn(const void* data, int width, size_t n, int least) noexcept {
+    int need = least;
+    for (size_t i = 0; i < n && need < width; ++i) need = std::max(need, widthOf(charOf(data, width, i)));
+    return need;
+}
+
+// Offsets are kept in 32 bits elsewhere (the scanner's spans, the damage);
+// a text must fit them.
 void requireFits(size_t chars) {
     if (chars >= std::numeric_limits<uint32_t>::max()) {
         PyErr_SetString(PyExc_OverflowError, "a document holds fewer than 2**32 - 1 characters");
@@ -29,220 +68,451 @@ void requireFits(size_t chars) {
     }
 }
 
+// The one pass over the chunks after an edit: vectorised, it costs a few
+// hundred cycles at 100k lines. Modular steps: every result is in range.
+[[gnu::noinline, gnu::optimize("tree-vectorize")]] void addToEach(size_t* p, size_t n, size_t step) noexcept {
+    for (size_t i = 0; i < n; ++i) p[i] += step;
+}
+
+[[gnu::noinline, gnu::optimize("tree-vectorize")]] void addToEach(uint16_t* p, size_t n, uint16_t step) noexcept {
+    for (size_t i = 0; i < n; ++i) p[i] = static_cast<uint16_t>(p[i] + step);
+}
+
+// Room for `extra` more items with a sixteenth to spare, so that memory
+// stays close to what is held and typing does not reallocate each time.
+template <class V>
+void roomFor(V& v, size_t extra) {
+    const size_t want = v.size() + extra;
+    if (want > v.capacity()) v.reserve(want + want / 16 + 8);
+}
+
 }  // namespace
+
+void setChunkSizes(size_t chars, size_t rows) noexcept {
+    gChunkChars = std::max<size_t>(chars, 1);
+    gMaxChunkChars = 2 * gChunkChars;
+    gMinChunkChars = std::max<size_t>(gChunkChars / 8, 1);
+    gChunkRows = std::max<size_t>(rows, 1);
+    gMaxChunkRows = 2 * gChunkRows;
+    gMinChunkRows = gChunkRows / 8;
+}
 
 // --- TextStore -----------------------------------------------------------------
 
+TextStore::TextStore() : chunks_(1), starts_(2, 0) {}
+
+size_t TextStore::find(size_t i) const noexcept {
+    if (i >= size_) return chunks_.size() - 1;
+    return static_cast<size_t>(std::upper_bound(starts_.begin() + 1, starts_.end(), i) - starts_.begin()) - 1;
+}
+
+void TextStore::restart(size_t from) noexcept {
+    starts_.resize(chunks_.size() + 1);
+    starts_[0] = 0;
+    for (size_t c = from; c < chunks_.size(); ++c) starts_[c + 1] = starts_[c] + chars(chunks_[c]);
+    size_ = starts_.back();
+    hint_ = 0;
+}
+
 void TextStore::assign(const void* data, int width, size_t n) {
     requireFits(n);
-    int need = 1;
-    if (width > 1) {
-        for (size_t i = 0; i < n && need < width; ++i) need = std::max(need, widthOf(charAt(data, width, i)));
+    const int need = widestIn(data, width, n, 1);
+    size_t crs = 0;
+    for (size_t i = 0; i < n; ++i) crs += charOf(data, width, i) == '\r';
+    std::vector<Chunk> fresh;
+    fresh.reserve(n / gChunkChars + 1);
+    const size_t w = static_cast<size_t>(need);
+    for (size_t at = 0; at < n || fresh.empty(); at += gChunkChars) {
+        const size_t k = std::min(gChunkChars, n - at);
+        Chunk chunk(k * w);
+        put(chunk.data(), need, static_cast<const uint8_t*>(data) + at * static_cast<size_t>(width), width, k);
+        fresh.push_back(std::move(chunk));
     }
-    carriageReturns_ = 0;
-    for (size_t i = 0; i < n; ++i) carriageReturns_ += charAt(data, width, i) == '\r';
-    std::vector<uint8_t> fresh((n + 64) * need);
-    buf_.swap(fresh);
+    chunks_.swap(fresh);
     width_ = need;
-    capacity_ = n + 64;
-    size_ = n;
-    gapStart_ = n;
-    gapEnd_ = capacity_;
-    if (width == need) {
-        if (n) std::memcpy(buf_.data(), data, n * width);
-    } else {
-        for (size_t i = 0; i < n; ++i) store(i, charAt(data, width, i));
-    }
-}
-
-void TextStore::moveGap(size_t pos) noexcept {
-    if (pos == gapStart_) return;
-    const size_t gap = gapEnd_ - gapStart_;
-    uint8_t* b = buf_.data();
-    const size_t w = static_cast<size_t>(width_);
-    if (pos < gapStart_) {
-        // Characters pos..gapStart_ go to the far side of the gap.
-        std::memmove(b + (pos + gap) * w, b + pos * w, (gapStart_ - pos) * w);
-    } else {
-        std::memmove(b + gapStart_ * w, b + gapEnd_ * w, (pos - gapStart_) * w);
-    }
-    gapStart_ = pos;
-    gapEnd_ = pos + gap;
-}
-
-void TextStore::reserveGap(size_t chars) {
-    if (gapEnd_ - gapStart_ >= chars) return;
-    requireFits(size_ + chars);
-    const size_t capacity = size_ + chars + std::max<size_t>(64, size_ / 8);
-    std::vector<uint8_t> fresh(capacity * width_);
-    const size_t w = static_cast<size_t>(width_);
-    const size_t tail = capacity_ - gapEnd_;
-    if (gapStart_) std::memcpy(fresh.data(), buf_.data(), gapStart_ * w);
-    if (tail) std::memcpy(fresh.data() + (capacity - tail) * w, buf_.data() + gapEnd_ * w, tail * w);
-    buf_.swap(fresh);
-    gapEnd_ = capacity - tail;
-    capacity_ = capacity;
+    carriageReturns_ = crs;
+    restart(0);
 }
 
 void TextStore::widen(int width) {
-    std::vector<uint8_t> fresh(capacity_ * width);
-    const int old = width_;
-    std::vector<uint8_t> oldBuf;
-    oldBuf.swap(buf_);
-    buf_.swap(fresh);
+    for (Chunk& chunk : chunks_) {
+        const size_t k = chars(chunk);
+        Chunk wide(k * static_cast<size_t>(width));
+        put(wide.data(), width, chunk.data(), width_, k);
+        chunk.swap(wide);
+    }
     width_ = width;
-    for (size_t k = 0; k < gapStart_; ++k) store(k, charAt(oldBuf.data(), old, k));
-    for (size_t k = gapEnd_; k < capacity_; ++k) store(k, charAt(oldBuf.data(), old, k));
+}
+
+void TextStore::rechunk(size_t first, size_t last, const Chunk& joined) {
+    const size_t w = static_cast<size_t>(width_);
+    const size_t m = joined.size() / w;
+    std::vector<Chunk> pieces;
+    if (m > 0) {
+        const size_t count = (m + gChunkChars - 1) / gChunkChars;
+        const size_t each = (m + count - 1) / count;
+        for (size_t at = 0; at < m; at += each) {
+            const size_t k = std::min(each, m - at);
+            Chunk piece(joined.begin() + static_cast<std::ptrdiff_t>(at * w),
+                        joined.begin() + static_cast<std::ptrdiff_t>((at + k) * w));
+            pieces.push_back(std::move(piece));
+        }
+    }
+    chunks_.erase(chunks_.begin() + static_cast<std::ptrdiff_t>(first),
+                  chunks_.begin() + static_cast<std::ptrdiff_t>(last + 1));
+    chunks_.insert(chunks_.begin() + static_cast<std::ptrdiff_t>(first), std::make_move_iterator(pieces.begin()),
+                   std::make_move_iterator(pieces.end()));
+    if (chunks_.empty()) chunks_.emplace_back();
+    restart(std::min(first, chunks_.size() - 1));
+    if (!pieces.empty()) mergeIfSmall(first);
+    else if (first < chunks_.size()) mergeIfSmall(first);
+}
+
+void TextStore::mergeIfSmall(size_t c) {
+    if (chunks_.size() < 2 || chars(chunks_[c]) >= gMinChunkChars) return;
+    // The smaller neighbour takes it in, if the two fit in one chunk.
+    size_t other = c + 1 < chunks_.size() ? c + 1 : c - 1;
+    if (c > 0 && c + 1 < chunks_.size() && chars(chunks_[c - 1]) < chars(chunks_[c + 1])) other = c - 1;
+    const size_t lo = std::min(c, other), hi = std::max(c, other);
+    if (chars(chunks_[lo]) + chars(chunks_[hi]) > gMaxChunkChars) {
+        if (chars(chunks_[c]) > 0) return;
+        chunks_.erase(chunks_.begin() + static_cast<std::ptrdiff_t>(c));
+        restart(c > 0 ? c - 1 : 0);
+        return;
+    }
+    roomFor(chunks_[lo], chunks_[hi].size());
+    chunks_[lo].insert(chunks_[lo].end(), chunks_[hi].begin(), chunks_[hi].end());
+    chunks_.erase(chunks_.begin() + static_cast<std::ptrdiff_t>(hi));
+    restart(lo);
 }
 
 void TextStore::replace(size_t start, size_t end, const void* data, int width, size_t n) {
-    int need = width_;
+    requireFits(size_ - (end - start) + n);
     if (width > width_) {
-        for (size_t i = 0; i < n && need < width; ++i) need = std::max(need, widthOf(charAt(data, width, i)));
+        const int need = widestIn(data, width, n, width_);
+        if (need > width_) widen(need);
     }
-    if (need > width_) widen(need);
-    for (size_t i = start; i < end; ++i) carriageReturns_ -= at(i) == '\r';
-    for (size_t i = 0; i < n; ++i) carriageReturns_ += charAt(data, width, i) == '\r';
-    moveGap(end);
-    // The removed characters join the gap.
-    gapStart_ = start;
-    size_ -= end - start;
-    reserveGap(n);
-    if (width == width_) {
-        if (n) std::memcpy(buf_.data() + gapStart_ * width_, data, n * width_);
-    } else {
-        for (size_t i = 0; i < n; ++i) store(gapStart_ + i, charAt(data, width, i));
+    const size_t w = static_cast<size_t>(width_);
+    size_t c0 = chunkOf(start);
+    const size_t c1 = end > start ? chunkOf(end - 1) : c0;
+    for (size_t c = c0, i = start; i < end; ++c) {
+        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
+        for (size_t k = from; k < to; ++k) carriageReturns_ -= charAt(chunks_[c].data(), k) == '\r';
+        i = starts_[c + 1];
     }
-    gapStart_ += n;
-    size_ += n;
+    for (size_t i = 0; i < n; ++i) carriageReturns_ += charOf(data, width, i) == '\r';
+
+    const size_t off0 = (start - starts_[c0]) * w;
+    const size_t off1 = (end - starts_[c1]) * w;
+    if (c0 == c1 && chars(chunks_[c0]) - (end - start) + n <= gMaxChunkChars) {
+        // Within one chunk: its tail moves, the chunks after start later.
+        Chunk& chunk = chunks_[c0];
+        const size_t oldBytes = chunk.size();
+        const size_t newBytes = oldBytes - (off1 - off0) + n * w;
+        if (newBytes > oldBytes) {
+            roomFor(chunk, newBytes - oldBytes);
+            chunk.resize(newBytes);
+        }
+        if (oldBytes > off1) std::memmove(chunk.data() + off0 + n * w, chunk.data() + off1, oldBytes - off1);
+        if (newBytes < oldBytes) chunk.resize(newBytes);
+        put(chunk.data() + off0, width_, data, width, n);
+        addToEach(starts_.data() + c0 + 1, starts_.size() - c0 - 1, n - (end - start));
+        size_ = starts_.back();
+        if (newBytes / w < gMinChunkChars) mergeIfSmall(c0);
+        return;
+    }
+    Chunk joined;
+    joined.reserve(off0 + n * w + (chunks_[c1].size() - off1));
+    joined.insert(joined.end(), chunks_[c0].begin(), chunks_[c0].begin() + static_cast<std::ptrdiff_t>(off0));
+    joined.resize(off0 + n * w);
+    put(joined.data() + off0, width_, data, width, n);
+    joined.insert(joined.end(), chunks_[c1].begin() + static_cast<std::ptrdiff_t>(off1), chunks_[c1].end());
+    rechunk(c0, c1, joined);
 }
 
-const void* TextStore::contiguousFrom(size_t pos) {
-    moveGap(pos);
-    return buf_.data() + gapEnd_ * width_;
+const void* TextStore::contiguous(size_t start, size_t end) {
+    const size_t w = static_cast<size_t>(width_);
+    const size_t c0 = chunkOf(start);
+    if (end <= starts_[c0 + 1] || start == end) return chunks_[c0].data() + (start - starts_[c0]) * w;
+    copy_.resize((end - start) * w);
+    uint8_t* out = copy_.data();
+    for (size_t c = c0, i = start; i < end; ++c) {
+        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
+        std::memcpy(out, chunks_[c].data() + from * w, (to - from) * w);
+        out += (to - from) * w;
+        i = starts_[c + 1];
+    }
+    return copy_.data();
+}
+
+void TextStore::releaseCopy() noexcept {
+    // A typing edit's few rows may keep theirs; a document at rest holds
+    // no more than that.
+    if (copy_.capacity() > 2048) Chunk().swap(copy_);
 }
 
 void TextStore::copyOut(size_t start, size_t end, std::vector<uint32_t>& out) const {
     out.reserve(out.size() + (end - start));
-    for (size_t i = start; i < end; ++i) out.push_back(at(i));
+    for (size_t c = chunkOf(start), i = start; i < end; ++c) {
+        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
+        for (size_t k = from; k < to; ++k) out.push_back(charAt(chunks_[c].data(), k));
+        i = starts_[c + 1];
+    }
 }
 
 PyObject* TextStore::slice(size_t start, size_t end) {
     const size_t w = static_cast<size_t>(width_);
-    const uint8_t* b = buf_.data();
-    if (end <= gapStart_) return py::check(compat::strFromWidth(b + start * w, width_, end - start)).release();
-    if (start >= gapStart_) {
-        const size_t gap = gapEnd_ - gapStart_;
-        return py::check(compat::strFromWidth(b + (start + gap) * w, width_, end - start)).release();
+    const size_t c0 = chunkOf(start);
+    if (end <= starts_[c0 + 1] || start == end) {
+        return py::check(compat::strFromWidth(chunks_[c0].data() + (start - starts_[c0]) * w, width_, end - start))
+            .release();
     }
-    // Across the gap: moved so that the slice is contiguous.
-    moveGap(end);
-    return py::check(compat::strFromWidth(b + start * w, width_, end - start)).release();
+    // Not through the copy: a reader may still be using it.
+    std::vector<uint8_t> joined((end - start) * w);
+    uint8_t* out = joined.data();
+    for (size_t c = c0, i = start; i < end; ++c) {
+        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
+        std::memcpy(out, chunks_[c].data() + from * w, (to - from) * w);
+        out += (to - from) * w;
+        i = starts_[c + 1];
+    }
+    return py::check(compat::strFromWidth(joined.data(), width_, end - start)).release();
 }
 
 size_t TextStore::findNewline(size_t from) const noexcept {
-    const size_t gap = gapEnd_ - gapStart_;
-    auto scan = [&](size_t lo, size_t hi, size_t shift) -> size_t {
-        // [lo, hi) in text positions, stored at + shift.
+    if (from >= size_) return size_;
+    for (size_t c = chunkOf(from); c < chunks_.size(); ++c) {
+        const uint8_t* p = chunks_[c].data();
+        const size_t k0 = from > starts_[c] ? from - starts_[c] : 0;
+        const size_t k1 = chars(chunks_[c]);
         if (width_ == 1) {
-            const void* p = lo < hi ? std::memchr(buf_.data() + lo + shift, '\n', hi - lo) : nullptr;
-            return p ? static_cast<const uint8_t*>(p) - buf_.data() - shift : hi + 1;
+            const void* hit = k0 < k1 ? std::memchr(p + k0, '\n', k1 - k0) : nullptr;
+            if (hit) return starts_[c] + static_cast<size_t>(static_cast<const uint8_t*>(hit) - p);
+        } else {
+            for (size_t k = k0; k < k1; ++k) {
+                if (charAt(p, k) == '\n') return starts_[c] + k;
+            }
         }
-        for (size_t i = lo; i < hi; ++i) {
-            if (charAt(buf_.data(), width_, i + shift) == '\n') return i;
-        }
-        return hi + 1;
-    };
-    if (from < gapStart_) {
-        const size_t found = scan(from, gapStart_, 0);
-        if (found < gapStart_) return found;
-        from = gapStart_;
     }
-    const size_t found = scan(from, size_, gap);
-    return found < size_ ? found : size_;
+    return size_;
+}
+
+size_t TextStore::commonPrefix(const void* data, int width, size_t n) const noexcept {
+    const size_t limit = std::min(size_, n);
+    const size_t w = static_cast<size_t>(width_);
+    size_t i = 0;
+    for (size_t c = 0; c < chunks_.size() && i < limit; ++c) {
+        const uint8_t* p = chunks_[c].data();
+        const size_t len = std::min(chars(chunks_[c]), limit - i);
+        size_t k = 0;
+        if (width == width_) {
+            const uint8_t* q = static_cast<const uint8_t*>(data) + i * w;
+            while (k + 64 <= len && std::memcmp(p + k * w, q + k * w, 64 * w) == 0) k += 64;
+        }
+        while (k < len && charAt(p, k) == charOf(data, width, i + k)) ++k;
+        i += k;
+        if (k < len) break;
+    }
+    return i;
+}
+
+size_t TextStore::commonSuffix(const void* data, int width, size_t n, size_t skip) const noexcept {
+    const size_t limit = std::min(size_, n) - std::min(skip, std::min(size_, n));
+    const size_t w = static_cast<size_t>(width_);
+    size_t t = 0;  // characters matched from the end
+    for (size_t c = chunks_.size(); c-- > 0 && t < limit;) {
+        const uint8_t* p = chunks_[c].data();
+        const size_t have = chars(chunks_[c]);
+        const size_t len = std::min(have, limit - t);
+        // Compares p[have-1-k] with data[n-1-t-k] for k < len.
+        size_t k = 0;
+        if (width == width_) {
+            while (k + 64 <= len &&
+                   std::memcmp(p + (have - k - 64) * w,
+                               static_cast<const uint8_t*>(data) + (n - t - k - 64) * w, 64 * w) == 0) {
+                k += 64;
+            }
+        }
+        while (k < len && charAt(p, have - 1 - k) == charOf(data, width, n - 1 - t - k)) ++k;
+        t += k;
+        if (k < len) break;
+    }
+    return t;
+}
+
+size_t TextStore::bytesHeld() const noexcept {
+    size_t held = chunks_.capacity() * sizeof(Chunk) + starts_.capacity() * sizeof(size_t) + copy_.capacity();
+    for (const Chunk& c : chunks_) held += c.capacity();
+    return held;
 }
 
 // --- RowTable ------------------------------------------------------------------
 
+RowTable::RowTable() : chunks_(1), bases_(1, 0), firstRows_{0, 1} {
+    chunks_[0].offsets.push_back(0);
+    chunks_[0].states.push_back(RowState());
+    chunks_[0].columns.push_back(kNoIndentCheck);
+}
+
+size_t RowTable::find(size_t r) const noexcept {
+    if (r >= count()) return chunks_.size() - 1;
+    return static_cast<size_t>(std::upper_bound(firstRows_.begin() + 1, firstRows_.end(), r) - firstRows_.begin()) -
+           1;
+}
+
+size_t RowTable::rowAt(size_t at) const noexcept {
+    // A chunk's first row starts at its base.
+    const size_t c =
+        static_cast<size_t>(std::upper_bound(bases_.begin() + 1, bases_.end(), at) - bases_.begin()) - 1;
+    const std::vector<uint16_t>& offsets = chunks_[c].offsets;
+    const size_t rel = at - bases_[c];
+    const size_t k = rel > kMaxOffset ? offsets.size()
+                                      : static_cast<size_t>(std::upper_bound(offsets.begin(), offsets.end(),
+                                                                             static_cast<uint16_t>(rel)) -
+                                                            offsets.begin());
+    return firstRows_[c] + k - 1;
+}
+
+void RowTable::renumber(size_t from) noexcept {
+    firstRows_.resize(chunks_.size() + 1);
+    firstRows_[0] = 0;
+    for (size_t c = from; c < chunks_.size(); ++c) firstRows_[c + 1] = firstRows_[c] + chunks_[c].size();
+    hint_ = 0;
+}
+
+void RowTable::shiftBases(size_t from, long delta) noexcept {
+    if (from < bases_.size()) addToEach(bases_.data() + from, bases_.size() - from, static_cast<size_t>(delta));
+}
+
+void RowTable::flatten(size_t c, size_t from, size_t to, long shift, Flat& out) const {
+    const Chunk& chunk = chunks_[c];
+    for (size_t i = from; i < to; ++i) {
+        out.starts.push_back(static_cast<size_t>(static_cast<long>(bases_[c] + chunk.offsets[i]) + shift));
+        out.states.push_back(chunk.states[i]);
+        out.columns.push_back(chunk.columns[i]);
+    }
+}
+
+void RowTable::rechunk(size_t first, size_t last, const Flat& flat) {
+    const size_t m = flat.starts.size();
+    std::vector<Chunk> pieces;
+    std::vector<size_t> bases;
+    const size_t count = std::max<size_t>(1, (m + gChunkRows - 1) / gChunkRows);
+    const size_t each = (m + count - 1) / count;
+    for (size_t i = 0; i < m;) {
+        // Up to `each` rows, fewer when their starts would not fit.
+        const size_t base = flat.starts[i];
+        size_t j = i + 1;
+        while (j < m && j - i < each && flat.starts[j] - base <= kMaxOffset) ++j;
+        Chunk piece;
+        piece.offsets.reserve(j - i);
+        for (size_t k = i; k < j; ++k) piece.offsets.push_back(static_cast<uint16_t>(flat.starts[k] - base));
+        piece.states.assign(flat.states.begin() + static_cast<std::ptrdiff_t>(i),
+                            flat.states.begin() + static_cast<std::ptrdiff_t>(j));
+        piece.columns.assign(flat.columns.begin() + static_cast<std::ptrdiff_t>(i),
+                             flat.columns.begin() + static_cast<std::ptrdiff_t>(j));
+        pieces.push_back(std::move(piece));
+        bases.push_back(base);
+        i = j;
+    }
+    const auto at = [](size_t k) { return static_cast<std::ptrdiff_t>(k); };
+    chunks_.erase(chunks_.begin() + at(first), chunks_.begin() + at(last + 1));
+    bases_.erase(bases_.begin() + at(first), bases_.begin() + at(last + 1));
+    chunks_.insert(chunks_.begin() + at(first), std::make_move_iterator(pieces.begin()),
+                   std::make_move_iterator(pieces.end()));
+    bases_.insert(bases_.begin() + at(first), bases.begin(), bases.end());
+    renumber(first);
+}
+
 void RowTable::assign(const TextStore& text) {
-    std::vector<uint32_t> starts;
-    starts.push_back(0);
+    Flat flat;
+    flat.starts.push_back(0);
     const size_t n = text.size();
-    for (size_t at = text.findNewline(0); at < n; at = text.findNewline(at + 1)) {
-        starts.push_back(static_cast<uint32_t>(at + 1));
-    }
-    const size_t rows = starts.size();
-    const size_t capacity = rows + 16;
-    // Exactly that: pushing left up to twice the room.
-    starts_.assign(capacity, 0);
-    std::copy(starts.begin(), starts.end(), starts_.begin());
-    states_.assign(capacity, RowState());
-    columns_.assign(capacity, kNoIndentCheck);
-    gapStart_ = rows;
-    gapEnd_ = capacity;
-}
-
-void RowTable::moveGap(size_t pos, size_t textSize) noexcept {
-    if (pos == gapStart_) return;
-    // The rows that cross the gap move as blocks; their starts change from
-    // offsets from the start to offsets from the end, or back.
-    size_t from, to, k;
-    if (pos < gapStart_) {
-        k = gapStart_ - pos;
-        from = pos;
-        to = gapEnd_ - k;
-        gapStart_ = pos;
-        gapEnd_ = to;
-    } else {
-        k = pos - gapStart_;
-        from = gapEnd_;
-        to = gapStart_;
-        gapStart_ += k;
-        gapEnd_ += k;
-    }
-    std::memmove(&starts_[to], &starts_[from], k * sizeof(uint32_t));
-    std::memmove(&states_[to], &states_[from], k * sizeof(RowState));
-    std::memmove(&columns_[to], &columns_[from], k * sizeof(int16_t));
-    const uint32_t size = static_cast<uint32_t>(textSize);
-    uint32_t* starts = &starts_[to];
-    for (size_t i = 0; i < k; ++i) starts[i] = size - starts[i];
-}
-
-void RowTable::reserveGap(size_t rows, size_t textSize) {
-    if (gap() >= rows) return;
-    (void)textSize;
-    const size_t used = count();
-    // A thirty-second spare: a line count that changes often reuses it,
-    // and the rows stay near 14 bytes each.
-    const size_t capacity = used + rows + std::max<size_t>(16, used / 32);
-    const size_t tail = starts_.size() - gapEnd_;
-    auto grow = [&](auto& v, auto fill) {
-        using V = std::decay_t<decltype(v)>;
-        V fresh(capacity, fill);
-        std::copy(v.begin(), v.begin() + gapStart_, fresh.begin());
-        std::copy(v.begin() + gapEnd_, v.end(), fresh.end() - tail);
-        v.swap(fresh);
-    };
-    grow(starts_, uint32_t(0));
-    grow(states_, RowState());
-    grow(columns_, kNoIndentCheck);
-    gapEnd_ = capacity - tail;
+    for (size_t at = text.findNewline(0); at < n; at = text.findNewline(at + 1)) flat.starts.push_back(at + 1);
+    flat.states.assign(flat.starts.size(), RowState());
+    flat.columns.assign(flat.starts.size(), kNoIndentCheck);
+    rechunk(0, chunks_.size() - 1, flat);
 }
 
 void RowTable::replace(size_t first, size_t removed, const std::vector<size_t>& newStarts, size_t newTextSize,
                        size_t oldTextSize, const RowState* states, const int16_t* columns) {
     requireFits(newTextSize);
-    // The rows after first+removed keep their offsets from the end; those
-    // up to `first` keep theirs from the start.
-    moveGap(first + 1 + removed, oldTextSize);
-    gapStart_ = first + 1;
-    reserveGap(newStarts.size(), newTextSize);
-    for (size_t k = 0; k < newStarts.size(); ++k) {
-        starts_[gapStart_] = static_cast<uint32_t>(newStarts[k]);
-        states_[gapStart_] = states ? states[k] : RowState();
-        columns_[gapStart_] = columns ? columns[k] : kNoIndentCheck;
-        ++gapStart_;
+    const long delta = static_cast<long>(newTextSize) - static_cast<long>(oldTextSize);
+    const size_t c = chunkOf(first);
+    const size_t k = first - firstRows_[c];
+    const size_t lastRemoved = first + removed;
+    const size_t added = newStarts.size();
+    Chunk& chunk = chunks_[c];
+    if (lastRemoved < firstRows_[c + 1]) {
+        const size_t rows = chunk.size() - removed + added;
+        const size_t after = chunk.size() - (k + 1 + removed);  // rows of the chunk below the edit
+        size_t lastOffset = 0;
+        if (after > 0) lastOffset = static_cast<size_t>(static_cast<long>(chunk.offsets.back()) + delta);
+        else if (added > 0) lastOffset = newStarts.back() - bases_[c];
+        if (rows <= gMaxChunkRows && lastOffset <= kMaxOffset) {
+            const auto at = [&](size_t i) { return static_cast<std::ptrdiff_t>(i); };
+            if (removed > 0) {
+                chunk.offsets.erase(chunk.offsets.begin() + at(k + 1), chunk.offsets.begin() + at(k + 1 + removed));
+                chunk.states.erase(chunk.states.begin() + at(k + 1), chunk.states.begin() + at(k + 1 + removed));
+                chunk.columns.erase(chunk.columns.begin() + at(k + 1), chunk.columns.begin() + at(k + 1 + removed));
+            }
+            if (added > 0) {
+                roomFor(chunk.offsets, added);
+                roomFor(chunk.states, added);
+                roomFor(chunk.columns, added);
+                std::vector<uint16_t> offsets(added);
+                for (size_t i = 0; i < added; ++i) offsets[i] = static_cast<uint16_t>(newStarts[i] - bases_[c]);
+                chunk.offsets.insert(chunk.offsets.begin() + at(k + 1), offsets.begin(), offsets.end());
+                if (states) {
+                    chunk.states.insert(chunk.states.begin() + at(k + 1), states, states + added);
+                } else {
+                    chunk.states.insert(chunk.states.begin() + at(k + 1), added, RowState());
+                }
+                if (columns) {
+                    chunk.columns.insert(chunk.columns.begin() + at(k + 1), columns, columns + added);
+                } else {
+                    chunk.columns.insert(chunk.columns.begin() + at(k + 1), added, kNoIndentCheck);
+                }
+            }
+            if (delta != 0) {
+                const size_t from = k + 1 + added;
+                addToEach(chunk.offsets.data() + from, chunk.offsets.size() - from, static_cast<uint16_t>(delta));
+                shiftBases(c + 1, delta);
+            }
+            if (added != removed) renumber(c);
+            if (rows < gMinChunkRows && chunks_.size() > 1) {
+                // Joined with a neighbour, cut again.
+                const size_t lo = c > 0 ? c - 1 : c;
+                Flat flat;
+                flatten(lo, 0, chunks_[lo].size(), 0, flat);
+                flatten(lo + 1, 0, chunks_[lo + 1].size(), 0, flat);
+                rechunk(lo, lo + 1, flat);
+            }
+            return;
+        }
     }
+    // Across chunks, or a chunk that outgrows itself: the chunks from the
+    // edit's row to the last row it removes are laid out flat and cut again.
+    const size_t c1 = chunkOf(lastRemoved);
+    Flat flat;
+    flatten(c, 0, k + 1, 0, flat);
+    for (size_t i = 0; i < added; ++i) {
+        flat.starts.push_back(newStarts[i]);
+        flat.states.push_back(states ? states[i] : RowState());
+        flat.columns.push_back(columns ? columns[i] : kNoIndentCheck);
+    }
+    flatten(c1, lastRemoved + 1 - firstRows_[c1], chunks_[c1].size(), delta, flat);
+    shiftBases(c1 + 1, delta);
+    rechunk(c, c1, flat);
+}
+
+size_t RowTable::bytesHeld() const noexcept {
+    size_t held = chunks_.capacity() * sizeof(Chunk) + (bases_.capacity() + firstRows_.capacity()) * sizeof(size_t);
+    for (const Chunk& c : chunks_) {
+        held += c.offsets.capacity() * sizeof(uint16_t) + c.states.capacity() * sizeof(RowState) +
+                c.columns.capacity() * sizeof(int16_t);
+    }
+    return held;
 }
 
 }  // namespace sdoc

@@ -1,17 +1,20 @@
 // The document's text and its rows.
 //
-// The text is a gap buffer of characters of one width (1, 2 or 4 bytes; the
-// widest a character of the text has needed so far). An edit moves the gap
-// to its place, so typing costs what the edit holds, not what the text
-// holds; the gap can be put before any character so that everything from
-// there to the end is one contiguous array for the reader.
+// The text is a list of chunks of a few thousand characters of one width
+// (1, 2 or 4 bytes; the widest a character of the text has needed so far).
+// An edit rewrites the chunks it touches and shifts the start of the
+// chunks after it, so an edit costs what it holds plus a pass over the
+// chunk starts, wherever it is and wherever the one before it was (a
+// single gap had to travel between them). The reader wants the characters
+// it scans one after the other: a range inside one chunk is read in place,
+// one that crosses chunks is copied out first.
 //
 // Rows are the physical lines (split at '\n' only): row k (0-based) starts
 // after the k-th '\n'. The row table keeps, per row, where it starts and
-// what the reader left for it (its entry state and indentation column).
-// It has a gap of its own: starts before the gap are offsets from the start
-// of the text, starts after it offsets from the end, so an edit shifts no
-// start but those it moves the gap across.
+// what the reader left for it (its entry state and indentation column), in
+// chunks of rows: a row's start is a 16-bit offset from its chunk's base,
+// so an edit shifts the rows after it in its own chunk and the bases of the
+// chunks after, and a row costs 8 bytes.
 #pragma once
 
 #include <Python.h>
@@ -24,61 +27,81 @@ namespace sdoc {
 
 class TextStore {
 public:
+    TextStore();
+
     size_t size() const noexcept { return size_; }
     int width() const noexcept { return width_; }
 
     uint32_t at(size_t i) const noexcept {
-        const size_t k = i < gapStart_ ? i : i + (gapEnd_ - gapStart_);
-        switch (width_) {
-        case 1: return buf_[k];
-        case 2: return reinterpret_cast<const uint16_t*>(buf_.data())[k];
-        default: return reinterpret_cast<const uint32_t*>(buf_.data())[k];
-        }
+        const size_t c = chunkOf(i);
+        return charAt(chunks_[c].data(), i - starts_[c]);
     }
 
     // The whole text becomes `n` characters of `width` bytes at `data`.
     void assign(const void* data, int width, size_t n);
     // Characters [start, end) become the `n` characters at `data`.
     void replace(size_t start, size_t end, const void* data, int width, size_t n);
-    // Moves the gap before character `pos`; characters pos..size() then
-    // follow each other at the returned address (the width is width()).
-    const void* contiguousFrom(size_t pos);
+    // Characters [start, end) one after the other at the returned address
+    // (width() bytes each): in place when one chunk holds them, else a copy
+    // that lasts until the next call or edit.
+    const void* contiguous(size_t start, size_t end);
+    // Lets a large copy go once its reader is done with it.
+    void releaseCopy() noexcept;
     // Characters [start, end) as 32-bit values (appended to `out`).
     void copyOut(size_t start, size_t end, std::vector<uint32_t>& out) const;
     // A new str of characters [start, end); throws on failure.
     PyObject* slice(size_t start, size_t end);
     // Where the next '\n' at or after `from` is; size() when there is none.
     size_t findNewline(size_t from) const noexcept;
-    size_t bytesHeld() const noexcept { return buf_.capacity(); }
+    // How many characters the text and the `n` at `data` share at the
+    // start; at the end, not counting the first `skip` of either.
+    size_t commonPrefix(const void* data, int width, size_t n) const noexcept;
+    size_t commonSuffix(const void* data, int width, size_t n, size_t skip) const noexcept;
+    size_t bytesHeld() const noexcept;
     // How many '\r' the text holds: without any, its lines split at
     // '\r\n', '\r' and '\n' are its rows.
     size_t carriageReturns() const noexcept { return carriageReturns_; }
 
 private:
-    void moveGap(size_t pos) noexcept;
-    void reserveGap(size_t chars);
-    void widen(int width);
-    void store(size_t k, uint32_t c) noexcept {
+    using Chunk = std::vector<uint8_t>;
+
+    uint32_t charAt(const uint8_t* p, size_t k) const noexcept {
         switch (width_) {
-        case 1: buf_[k] = static_cast<uint8_t>(c); break;
-        case 2: reinterpret_cast<uint16_t*>(buf_.data())[k] = static_cast<uint16_t>(c); break;
-        default: reinterpret_cast<uint32_t*>(buf_.data())[k] = c; break;
+        case 1: return p[k];
+        case 2: return reinterpret_cast<const uint16_t*>(p)[k];
+        default: return reinterpret_cast<const uint32_t*>(p)[k];
         }
     }
+    size_t chars(const Chunk& c) const noexcept { return c.size() / static_cast<size_t>(width_); }
+    // The chunk holding character `i`; the last one for i == size().
+    size_t chunkOf(size_t i) const noexcept {
+        if (i >= starts_[hint_] && i < starts_[hint_ + 1]) return hint_;
+        return hint_ = find(i);
+    }
+    size_t find(size_t i) const noexcept;
+    void widen(int width);
+    // Chunks [first, last] become the characters of `joined`, cut in pieces.
+    void rechunk(size_t first, size_t last, const Chunk& joined);
+    void restart(size_t from) noexcept;  // starts_ from chunk `from` on
+    void mergeIfSmall(size_t c);
 
-    std::vector<uint8_t> buf_;  // capacity() characters of width_ bytes
+    std::vector<Chunk> chunks_;   // never empty; an empty chunk only alone
+    std::vector<size_t> starts_;  // starts_[c]: chunk c's first character; then size()
+    mutable size_t hint_ = 0;
     int width_ = 1;
-    size_t size_ = 0;           // characters of text
-    size_t gapStart_ = 0;       // characters
-    size_t gapEnd_ = 0;
-    size_t capacity_ = 0;       // characters
+    size_t size_ = 0;
     size_t carriageReturns_ = 0;
+    std::vector<uint8_t> copy_;
 };
 
-// What the reader leaves at the break before a row. Opaque here: the
-// engine compares and stores it.
+// Chunks of about `chars` characters and `rows` rows from now on (tests
+// make them tiny); documents made before keep working.
+void setChunkSizes(size_t chars, size_t rows) noexcept;
+
+// What the reader leaves at the break before a row, packed in 32 bits.
+// Opaque here: the engine packs, compares and stores it.
 struct RowState {
-    uint64_t bits = 0;
+    uint32_t bits = 0;
     bool operator==(const RowState& o) const noexcept { return bits == o.bits; }
     bool operator!=(const RowState& o) const noexcept { return bits != o.bits; }
 };
@@ -88,43 +111,76 @@ constexpr int16_t kNoIndentCheck = -1;
 
 class RowTable {
 public:
-    size_t count() const noexcept { return starts_.size() - gap(); }
+    RowTable();
 
-    // Where row `r` starts, for a text of `textSize` characters.
-    size_t start(size_t r, size_t textSize) const noexcept {
-        return r < gapStart_ ? starts_[r] : textSize - starts_[r + gap()];
+    size_t count() const noexcept { return firstRows_.back(); }
+
+    // Where row `r` starts (the text's size is no longer needed; kept so
+    // that a call reads the same in every file).
+    size_t start(size_t r, size_t /*textSize*/) const noexcept {
+        const size_t c = chunkOf(r);
+        return bases_[c] + chunks_[c].offsets[r - firstRows_[c]];
     }
-    RowState& state(size_t r) noexcept { return states_[slot(r)]; }
-    const RowState& state(size_t r) const noexcept { return states_[slot(r)]; }
-    int16_t& column(size_t r) noexcept { return columns_[slot(r)]; }
-    int16_t column(size_t r) const noexcept { return columns_[slot(r)]; }
+    RowState& state(size_t r) noexcept {
+        const size_t c = chunkOf(r);
+        return chunks_[c].states[r - firstRows_[c]];
+    }
+    const RowState& state(size_t r) const noexcept {
+        const size_t c = chunkOf(r);
+        return chunks_[c].states[r - firstRows_[c]];
+    }
+    int16_t& column(size_t r) noexcept {
+        const size_t c = chunkOf(r);
+        return chunks_[c].columns[r - firstRows_[c]];
+    }
+    int16_t column(size_t r) const noexcept {
+        const size_t c = chunkOf(r);
+        return chunks_[c].columns[r - firstRows_[c]];
+    }
+    // The last row starting at or before character `at` (0-based).
+    size_t rowAt(size_t at) const noexcept;
 
     // Rows of a fresh text: one per '\n', plus the row after the last.
     void assign(const TextStore& text);
     // Rows first+1 .. first+removed (0-based) are taken out and rows
     // starting at `newStarts` (offsets in the text after the edit, whose
     // size is `newTextSize`) put in their place; the rows after shift by
-    // `delta` characters. States and columns of the new rows are unset.
+    // the change in size. States and columns of the new rows are unset.
     // With `states` and `columns` (one per new row) the new rows take
     // them; an edit undone puts back what it took out.
     void replace(size_t first, size_t removed, const std::vector<size_t>& newStarts, size_t newTextSize,
                  size_t oldTextSize, const RowState* states = nullptr, const int16_t* columns = nullptr);
-    size_t bytesHeld() const noexcept {
-        return starts_.capacity() * sizeof(uint32_t) + states_.capacity() * sizeof(RowState) +
-               columns_.capacity() * sizeof(int16_t);
-    }
+    size_t bytesHeld() const noexcept;
 
 private:
-    size_t gap() const noexcept { return gapEnd_ - gapStart_; }
-    size_t slot(size_t r) const noexcept { return r < gapStart_ ? r : r + gap(); }
-    void moveGap(size_t pos, size_t textSize) noexcept;
-    void reserveGap(size_t rows, size_t textSize);
+    struct Chunk {
+        std::vector<uint16_t> offsets;  // from the chunk's base
+        std::vector<RowState> states;
+        std::vector<int16_t> columns;
+        size_t size() const noexcept { return offsets.size(); }
+    };
+    // Rows laid out flat while chunks are cut again.
+    struct Flat {
+        std::vector<size_t> starts;
+        std::vector<RowState> states;
+        std::vector<int16_t> columns;
+    };
 
-    std::vector<uint32_t> starts_;
-    std::vector<RowState> states_;
-    std::vector<int16_t> columns_;
-    size_t gapStart_ = 0;
-    size_t gapEnd_ = 0;
+    size_t chunkOf(size_t r) const noexcept {
+        if (r >= firstRows_[hint_] && r < firstRows_[hint_ + 1]) return hint_;
+        return hint_ = find(r);
+    }
+    size_t find(size_t r) const noexcept;
+    void flatten(size_t c, size_t from, size_t to, long shift, Flat& out) const;
+    // Chunks [first, last] become the rows of `flat`, cut in pieces.
+    void rechunk(size_t first, size_t last, const Flat& flat);
+    void renumber(size_t from) noexcept;  // firstRows_ from chunk `from` on
+    void shiftBases(size_t from, long delta) noexcept;
+
+    std::vector<Chunk> chunks_;       // never empty, nor any chunk in it
+    std::vector<size_t> bases_;       // per chunk
+    std::vector<size_t> firstRows_;   // firstRows_[c]: chunk c's first row; then count()
+    mutable size_t hint_ = 0;
 };
 
 }  // namespace sdoc
