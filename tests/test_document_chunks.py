@@ -88,6 +88,36 @@ class LongRowsTest(unittest.TestCase):
         Agrees(self, doc, text)
 
 
+class DeepBracketsTest(unittest.TestCase):
+    """Rows deeper in brackets than a row's state holds, and rows after more
+    stray closers than it holds: read again, never taken as unchanged."""
+
+    def Replay(self, text, rng, steps):
+        doc = CScopeDocument(text, 'c.py')
+        Agrees(self, doc, text)
+        for _ in range(steps):
+            start, end, new = RandomEdit(rng, text)
+            if rng.random() < 0.3:
+                new = rng.choice(['(', ')', ')' * 3, '(' * 3, '\n'])
+            doc.Edit(*(Place(text, start) + Place(text, end) + (new,)))
+            text = text[:start] + new + text[end:]
+            Agrees(self, doc, text)
+
+    def testDeepOpenBrackets(self):
+        text = ('def f():\n    x = ' + '(' * 700 + '\n' + '        1,\n' * 30 + ')' * 700 + '\n'
+                'class C:\n    y = [\n' + '[' * 600 + '\n' + ']' * 600 + '\n]\n')
+        self.Replay(text, Random(7), 60)
+
+    def testManyStrayClosers(self):
+        text = 'a = 1\n' + ')' * 800 + '\n' + 'def g():\n    return 2\n' * 20
+        self.Replay(text, Random(8), 40)
+        doc = CScopeDocument(text, 'c.py')
+        line = 2
+        doc.Edit(line, 0, line, 800, '')  # the closers taken out: the text reads
+        fixed = text.replace(')' * 800, '')
+        Agrees(self, doc, fixed)
+
+
 class WholeTextTest(unittest.TestCase):
 
     def Big(self):

@@ -41,12 +41,14 @@ using reader::Scanner;
 
 namespace {
 
-// A row keeps the state in 32 bits: the string kind in 3 bits, the three
-// flags, and the bracket depth in the other 26. A depth past that (tens of
-// millions of unclosed or stray brackets) is kept as kEscaped, which no
-// read starts from and no read converges on: such rows are read again.
-constexpr uint32_t kEscaped = 7;
-constexpr int32_t kDepthLimit = 1 << 25;
+// A row keeps the state in 16 bits: the string kind in 3 bits, the three
+// flags, and the bracket depth in the other 10. A row at a deeper depth is
+// inside brackets (never a place to start or stop a read) and one below
+// -512 is in a text that does not read (read to its end at each edit
+// anyway), so such a depth is kept as kEscaped, which no read starts from
+// and no read converges on.
+constexpr uint16_t kEscaped = 7;
+constexpr int32_t kDepthLimit = 1 << 9;
 
 RowState pack(const LineState& s) noexcept {
     RowState r;
@@ -54,16 +56,10 @@ RowState pack(const LineState& s) noexcept {
         r.bits = kEscaped;
         return r;
     }
-    r.bits = uint32_t{s.string} | uint32_t{s.needcont} << 3 | uint32_t{s.cont} << 4 | uint32_t{s.open} << 5 |
-             static_cast<uint32_t>(s.depth) << 6;
+    r.bits = static_cast<uint16_t>(uint32_t{s.string} | uint32_t{s.needcont} << 3 | uint32_t{s.cont} << 4 |
+                                   uint32_t{s.open} << 5 | static_cast<uint32_t>(s.depth) << 6);
     return r;
 }
-
-// A whole read leaves a copy of the text behind; it goes when the read does.
-struct CopyReleased {
-    TextStore& text;
-    ~CopyReleased() { text.releaseCopy(); }
-};
 
 bool escaped(const RowState& r) noexcept { return (r.bits & 7u) == kEscaped; }
 
@@ -73,12 +69,18 @@ LineState unpack(const RowState& r) noexcept {
     s.needcont = static_cast<uint8_t>(r.bits >> 3 & 1u);
     s.cont = static_cast<uint8_t>(r.bits >> 4 & 1u);
     s.open = static_cast<uint8_t>(r.bits >> 5 & 1u);
-    s.depth = static_cast<int32_t>(r.bits) >> 6;
+    s.depth = static_cast<int16_t>(r.bits) >> 6;
     return s;
 }
 
 // A read may start at a row whose state continues no logical.
 bool startsClean(const RowState& r) noexcept { return !escaped(r) && !unpack(r).midLogical(); }
+
+// A whole read leaves a copy of the text behind; it goes when the read does.
+struct CopyReleased {
+    TextStore& text;
+    ~CopyReleased() { text.releaseCopy(); }
+};
 
 int16_t columnOf(int64_t c) noexcept {
     if (c < 0) return kNoIndentCheck;

@@ -14,7 +14,7 @@
 // what the reader left for it (its entry state and indentation column), in
 // chunks of rows: a row's start is a 16-bit offset from its chunk's base,
 // so an edit shifts the rows after it in its own chunk and the bases of the
-// chunks after, and a row costs 8 bytes.
+// chunks after, and a row costs 6 bytes.
 #pragma once
 
 #include <Python.h>
@@ -98,10 +98,10 @@ private:
 // make them tiny); documents made before keep working.
 void setChunkSizes(size_t chars, size_t rows) noexcept;
 
-// What the reader leaves at the break before a row, packed in 32 bits.
+// What the reader leaves at the break before a row, packed in 16 bits.
 // Opaque here: the engine packs, compares and stores it.
 struct RowState {
-    uint32_t bits = 0;
+    uint16_t bits = 0;
     bool operator==(const RowState& o) const noexcept { return bits == o.bits; }
     bool operator!=(const RowState& o) const noexcept { return bits != o.bits; }
 };
