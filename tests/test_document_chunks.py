@@ -149,7 +149,7 @@ class WholeTextTest(unittest.TestCase):
         narrow = self.Big()
         doc.SetText(narrow)
         Agrees(self, doc, narrow)
-        self.assertEqual(doc.GetLine(1), narrow.split('\n')[0] + '\n')
+        self.assertEqual(doc.GetLine(1), narrow.split('\n')[0])
 
 
 if __name__ == '__main__':
