@@ -162,7 +162,9 @@ extern bool gCheckEveryEdit;
 // --- reread.cpp ------------------------------------------------------------------------
 // Reads a fresh text whole: rows' states, the logicals (or the error).
 // Returns the list of logicals, or null with the document's error set.
-py::Ref readWhole(Document& d);
+// `source`, when given, is the text's characters in the store's width: read
+// in place of a copy of the store's.
+py::Ref readWhole(Document& d, const void* source = nullptr);
 // Reads the damaged part again and, when the text reads, brings the list,
 // the names and the cache to it.
 void reread(Document& d, EditOutcome& out);

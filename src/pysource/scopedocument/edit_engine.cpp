@@ -226,7 +226,7 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
     d.damage = Damage();
     d.stats = EditStats();
     d.version = 0;
-    py::Ref fresh = readWhole(d);
+    py::Ref fresh = readWhole(d, chars.width == d.text.width() ? chars.data : nullptr);
     if (fresh) {
         py::checkStatus(PyList_SetSlice(d.list.get(), 0, 0, fresh.get()));
         d.readable = true;

@@ -335,10 +335,11 @@ py::Ref makeLogicals(const Scanner<Char>& scanner, const Char* text, Document& d
 }
 
 template <class Char>
-py::Ref readWholeAs(Document& d) {
+py::Ref readWholeAs(Document& d, const void* source) {
     const size_t bom = bomLength(d);
     const size_t length = d.text.size() - bom;
-    const Char* p = static_cast<const Char*>(d.text.contiguous(bom, d.text.size()));
+    const Char* p = source ? static_cast<const Char*>(source) + bom
+                           : static_cast<const Char*>(d.text.contiguous(bom, d.text.size()));
     Scanner<Char> scanner(p, length);
     const size_t count = d.rows.count();
     size_t row = 0;
@@ -432,7 +433,7 @@ void rereadAs(Document& d, EditOutcome& out) {
         // The scanner reads a window of whole rows, in place when one chunk
         // of the text holds it. The rows in a window read as they do in the
         // whole text, but its end is no end: a read that runs out of its
-        // window goes on in one four times as large, from the same base, so
+        // window goes on in one eight times as large, from the same base, so
         // that what it has read stays valid.
         size_t windowRows = 16 + 2 * (afterRow[j] - G.first);
         auto windowEnd = [&] { return G.first + windowRows >= count ? n : d.rows.start(G.first + windowRows, n); };
@@ -467,7 +468,7 @@ void rereadAs(Document& d, EditOutcome& out) {
                 }
             }
             if (G.converged || scanner.error() || end == n) break;
-            windowRows *= 4;
+            windowRows *= 8;
             end = windowEnd();
             p = static_cast<const Char*>(d.text.contiguous(base, end));
             scanner.retarget(p, end - base);
@@ -710,12 +711,12 @@ size_t bomLength(const Document& d) {
     return t.size() >= 3 && t.at(0) == 0xEF && t.at(1) == 0xBB && t.at(2) == 0xBF ? 3 : 0;
 }
 
-py::Ref readWhole(Document& d) {
+py::Ref readWhole(Document& d, const void* source) {
     CopyReleased release{d.text};
     switch (d.text.width()) {
-    case 1: return readWholeAs<uint8_t>(d);
-    case 2: if constexpr (compat::kPython3) return readWholeAs<uint16_t>(d); break;
-    default: if constexpr (compat::kPython3) return readWholeAs<uint32_t>(d); break;
+    case 1: return readWholeAs<uint8_t>(d, source);
+    case 2: if constexpr (compat::kPython3) return readWholeAs<uint16_t>(d, source); break;
+    default: if constexpr (compat::kPython3) return readWholeAs<uint32_t>(d, source); break;
     }
     msg::raise(PyExc_SystemError, "a 2.7 text holds bytes only");
 }
