@@ -40,14 +40,6 @@ struct DroppedRows {
     std::vector<int16_t> columns;
 };
 
-uint32_t charOf(const void* data, int width, size_t i) noexcept {
-    switch (width) {
-    case 1: return static_cast<const uint8_t*>(data)[i];
-    case 2: return static_cast<const uint16_t*>(data)[i];
-    default: return static_cast<const uint32_t*>(data)[i];
-    }
-}
-
 // Characters [start, end) of the text replaced by the `n` characters at
 // `data`, with the rows following; `restore` gives the states and columns
 // of the rows it puts in (an undo).

@@ -25,14 +25,6 @@ size_t gMinChunkRows = 64;
 // A chunk's rows start within 64K characters of its base.
 constexpr size_t kMaxOffset = std::numeric_limits<uint16_t>::max();
 
-inline uint32_t charOf(const void* data, int width, size_t i) noexcept {
-    switch (width) {
-    case 1: return static_cast<const uint8_t*>(data)[i];
-    case 2: return static_cast<const uint16_t*>(data)[i];
-    default: return static_cast<const uint32_t*>(data)[i];
-    }
-}
-
 inline void storeChar(uint8_t* p, int width, size_t i, uint32_t c) noexcept {
     switch (width) {
     case 1: p[i] = static_cast<uint8_t>(c); break;
@@ -164,8 +156,7 @@ void TextStore::rechunk(size_t first, size_t last, const Chunk& joined) {
                    std::make_move_iterator(pieces.end()));
     if (chunks_.empty()) chunks_.emplace_back();
     restart(std::min(first, chunks_.size() - 1));
-    if (!pieces.empty()) mergeIfSmall(first);
-    else if (first < chunks_.size()) mergeIfSmall(first);
+    if (first < chunks_.size()) mergeIfSmall(first);
 }
 
 void TextStore::mergeIfSmall(size_t c) {
@@ -193,13 +184,11 @@ void TextStore::replace(size_t start, size_t end, const void* data, int width, s
         if (need > width_) widen(need);
     }
     const size_t w = static_cast<size_t>(width_);
-    size_t c0 = chunkOf(start);
+    const size_t c0 = chunkOf(start);
     const size_t c1 = end > start ? chunkOf(end - 1) : c0;
-    for (size_t c = c0, i = start; i < end; ++c) {
-        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
-        for (size_t k = from; k < to; ++k) carriageReturns_ -= charAt(chunks_[c].data(), k) == '\r';
-        i = starts_[c + 1];
-    }
+    eachPiece(start, end, [&](const uint8_t* p, size_t from, size_t to) {
+        for (size_t k = from; k < to; ++k) carriageReturns_ -= charAt(p, k) == '\r';
+    });
     for (size_t i = 0; i < n; ++i) carriageReturns_ += charOf(data, width, i) == '\r';
 
     const size_t off0 = (start - starts_[c0]) * w;
@@ -235,14 +224,16 @@ const void* TextStore::contiguous(size_t start, size_t end) {
     const size_t c0 = chunkOf(start);
     if (end <= starts_[c0 + 1] || start == end) return chunks_[c0].data() + (start - starts_[c0]) * w;
     copy_.resize((end - start) * w);
-    uint8_t* out = copy_.data();
-    for (size_t c = c0, i = start; i < end; ++c) {
-        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
-        std::memcpy(out, chunks_[c].data() + from * w, (to - from) * w);
-        out += (to - from) * w;
-        i = starts_[c + 1];
-    }
+    copyChars(start, end, copy_.data());
     return copy_.data();
+}
+
+void TextStore::copyChars(size_t start, size_t end, uint8_t* out) const noexcept {
+    const size_t w = static_cast<size_t>(width_);
+    eachPiece(start, end, [&](const uint8_t* p, size_t from, size_t to) {
+        std::memcpy(out, p + from * w, (to - from) * w);
+        out += (to - from) * w;
+    });
 }
 
 void TextStore::releaseCopy() noexcept {
@@ -253,11 +244,9 @@ void TextStore::releaseCopy() noexcept {
 
 void TextStore::copyOut(size_t start, size_t end, std::vector<uint32_t>& out) const {
     out.reserve(out.size() + (end - start));
-    for (size_t c = chunkOf(start), i = start; i < end; ++c) {
-        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
-        for (size_t k = from; k < to; ++k) out.push_back(charAt(chunks_[c].data(), k));
-        i = starts_[c + 1];
-    }
+    eachPiece(start, end, [&](const uint8_t* p, size_t from, size_t to) {
+        for (size_t k = from; k < to; ++k) out.push_back(charAt(p, k));
+    });
 }
 
 PyObject* TextStore::slice(size_t start, size_t end) {
@@ -269,13 +258,7 @@ PyObject* TextStore::slice(size_t start, size_t end) {
     }
     // Not through the copy: a reader may still be using it.
     std::vector<uint8_t> joined((end - start) * w);
-    uint8_t* out = joined.data();
-    for (size_t c = c0, i = start; i < end; ++c) {
-        const size_t from = i - starts_[c], to = std::min(end, starts_[c + 1]) - starts_[c];
-        std::memcpy(out, chunks_[c].data() + from * w, (to - from) * w);
-        out += (to - from) * w;
-        i = starts_[c + 1];
-    }
+    copyChars(start, end, joined.data());
     return py::check(compat::strFromWidth(joined.data(), width_, end - start)).release();
 }
 

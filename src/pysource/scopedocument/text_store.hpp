@@ -19,11 +19,21 @@
 
 #include <Python.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <cstring>
 #include <vector>
 
 namespace sdoc {
+
+// Character `i` of `data`, characters of `width` bytes.
+inline uint32_t charOf(const void* data, int width, size_t i) noexcept {
+    switch (width) {
+    case 1: return static_cast<const uint8_t*>(data)[i];
+    case 2: return static_cast<const uint16_t*>(data)[i];
+    default: return static_cast<const uint32_t*>(data)[i];
+    }
+}
 
 class TextStore {
 public:
@@ -65,13 +75,7 @@ public:
 private:
     using Chunk = std::vector<uint8_t>;
 
-    uint32_t charAt(const uint8_t* p, size_t k) const noexcept {
-        switch (width_) {
-        case 1: return p[k];
-        case 2: return reinterpret_cast<const uint16_t*>(p)[k];
-        default: return reinterpret_cast<const uint32_t*>(p)[k];
-        }
-    }
+    uint32_t charAt(const uint8_t* p, size_t k) const noexcept { return charOf(p, width_, k); }
     size_t chars(const Chunk& c) const noexcept { return c.size() / static_cast<size_t>(width_); }
     // The chunk holding character `i`; the last one for i == size().
     size_t chunkOf(size_t i) const noexcept {
@@ -79,6 +83,16 @@ private:
         return hint_ = find(i);
     }
     size_t find(size_t i) const noexcept;
+    // f(chunk data, from, to) for each chunk's part of characters [start, end).
+    template <class F>
+    void eachPiece(size_t start, size_t end, F f) const {
+        for (size_t c = chunkOf(start), i = start; i < end; ++c) {
+            f(chunks_[c].data(), i - starts_[c], std::min(end, starts_[c + 1]) - starts_[c]);
+            i = starts_[c + 1];
+        }
+    }
+    // Characters [start, end) written one after the other at `out`.
+    void copyChars(size_t start, size_t end, uint8_t* out) const noexcept;
     void widen(int width);
     // Chunks [first, last] become the characters of `joined`, cut in pieces.
     void rechunk(size_t first, size_t last, const Chunk& joined);
