@@ -186,6 +186,17 @@ inline PyObject* internStr(const char* text) noexcept {
 #endif
 }
 
+// obj.name(a[, b]) with `name` an interned str: no format to parse and, on
+// 3.9 on, no bound method or argument tuple made.
+inline PyObject* callMethod(PyObject* obj, PyObject* name, PyObject* a, PyObject* b = nullptr) noexcept {
+#if PY_VERSION_HEX >= 0x03090000
+    PyObject* args[3] = {obj, a, b};
+    return PyObject_VectorcallMethod(name, args, b != nullptr ? 3 : 2, nullptr);
+#else
+    return PyObject_CallMethodObjArgs(obj, name, a, b, nullptr);
+#endif
+}
+
 // A new str of the pieces joined, made in one allocation when it can be.
 template <size_t N>
 PyObject* strConcat(const std::string_view (&parts)[N]) noexcept {

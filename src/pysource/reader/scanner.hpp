@@ -117,6 +117,14 @@ struct ScanError {
 };
 
 // Char: uint8_t (2.7 bytes, 3.x one-byte str), uint16_t, uint32_t.
+// A scanner's working vectors, kept between scans by a caller that scans
+// often (a document at each edit), so that a scan need not allocate them.
+struct ScanBuffers {
+    std::vector<int64_t> indents;
+    std::vector<TokenSpan> tokens;
+    std::vector<Record> records;
+};
+
 template <class Char>
 class Scanner {
 public:
@@ -151,6 +159,20 @@ public:
     int64_t rowIndentColumn() const { return rowIndentColumn_; }
     const std::vector<int64_t>& indents() const { return indents_; }
 
+    // Scan into `b`'s vectors (call before start) and hand them back after;
+    // a vector grown past `keep` elements is freed rather than kept.
+    void borrow(ScanBuffers& b) noexcept {
+        indents_.swap(b.indents);
+        tokens_.swap(b.tokens);
+        records_.swap(b.records);
+    }
+    void giveBack(ScanBuffers& b, size_t keep) noexcept {
+        borrow(b);
+        trim(b.indents, keep);
+        trim(b.tokens, keep);
+        trim(b.records, keep);
+    }
+
     const std::vector<TokenSpan>& tokens() const { return tokens_; }
     const std::vector<Record>& records() const { return records_; }
     const ScanError& error() const { return error_; }
@@ -161,6 +183,11 @@ public:
     void clearOutput();
 
 private:
+    template <class T>
+    static void trim(std::vector<T>& v, size_t keep) noexcept {
+        if (v.capacity() > keep) std::vector<T>().swap(v);
+        v.clear();
+    }
     void addToken(size_t begin, size_t end, int64_t lineno, size_t rowStart, size_t column);
     void endStatement();
     void addBlank(int64_t lineno, const Char* row, size_t column);

@@ -14,6 +14,7 @@
 #pragma once
 
 #include "common/pyref.hpp"
+#include "pysource/reader/scanner.hpp"
 #include "pysource/scopedocument/text_store.hpp"
 
 #include <climits>
@@ -75,6 +76,12 @@ struct StackCache {
     std::vector<int64_t> stack;
 };
 
+// Working vectors an edit reuses from the last one, not allocated anew.
+struct Scratch {
+    reader::ScanBuffers scan;
+    std::vector<size_t> startRow, afterRow;
+};
+
 struct Document {
     TextStore text;
     RowTable rows;
@@ -90,6 +97,7 @@ struct Document {
     Damage damage;
     EditStats stats;
     StackCache stackCache;
+    Scratch scratch;
 };
 
 struct DocumentObject {
@@ -149,9 +157,19 @@ struct EditRequest {
     PyObject* endColumn;
     PyObject* text;
 };
+// Edits in a row, from a vector or a single one, without a copy.
+struct EditRequests {
+    const EditRequest* first;
+    size_t count;
+    EditRequests(const std::vector<EditRequest>& v) noexcept : first(v.data()), count(v.size()) {}
+    EditRequests(const EditRequest& one) noexcept : first(&one), count(1) {}
+    const EditRequest* begin() const noexcept { return first; }
+    const EditRequest* end() const noexcept { return first + count; }
+    size_t size() const noexcept { return count; }
+};
 // Applies the edits in order, each in the coordinates the ones before it
 // left, as one change; returns the CEditResult. A bad edit changes nothing.
-py::Ref applyEdits(Document& d, const std::vector<EditRequest>& requests, bool utf16);
+py::Ref applyEdits(Document& d, EditRequests requests, bool utf16);
 // A whole new text as one edit.
 py::Ref setText(Document& d, PyObject* source);
 // The current text as a str (cached until the next edit).
@@ -208,6 +226,10 @@ struct Imports {
     PyTypeObject* logicalType;  // pysource._fastaccess.LogicalLineType
     PyObject* emptyName;        // ""
     PyObject* syntaxError;      // SyntaxError
+    PyObject* findChanges;      // method names, interned
+    PyObject* clear;
+    PyObject* getBodyOfScope;
+    PyObject* getScopeDef;
 };
 extern Imports gImports;
 void bindImports();

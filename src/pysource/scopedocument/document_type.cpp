@@ -105,14 +105,20 @@ PyObject* m_Edit(PyObject* self, PyObject* args, PyObject* kwargs) {
         static const char* kwlist[] = {"start_line", "start_col", "end_line", "end_col", "text", "utf16", nullptr};
         EditRequest request;
         PyObject* utf16 = nullptr;
-        if (!PyArg_ParseTupleAndKeywords(args, kwargs, "OOOOO|O:Edit", const_cast<char**>(kwlist), &request.startLine,
-                                         &request.startColumn, &request.endLine, &request.endColumn, &request.text, &utf16)) {
+        // Five positional arguments, as an editor sends a keystroke, need
+        // no parsing.
+        if (kwargs == nullptr && PyTuple_GET_SIZE(args) == 5) {
+            PyObject** items = &PyTuple_GET_ITEM(args, 0);
+            request = EditRequest{items[0], items[1], items[2], items[3], items[4]};
+        } else if (!PyArg_ParseTupleAndKeywords(args, kwargs, "OOOOO|O:Edit", const_cast<char**>(kwlist),
+                                                &request.startLine, &request.startColumn, &request.endLine,
+                                                &request.endColumn, &request.text, &utf16)) {
             py::fail();
         }
         Document& d = ready(self);
         const bool units = flagArgument(utf16, "utf16");
         requireEditText(request.text);
-        return applyEdits(d, {request}, units).release();
+        return applyEdits(d, request, units).release();
     });
 }
 
@@ -208,7 +214,7 @@ PyObject* m_GetBodyOfScope(PyObject* self, PyObject* name) {
         Document& d = ready(self);
         BusyGuard busy(d);
         py::Ref body = py::check(
-            PyObject_CallMethod(d.cache.get(), const_cast<char*>("GetBodyOfScope"), const_cast<char*>("(O)"), name));
+            compat::callMethod(d.cache.get(), gImports.getBodyOfScope, name));
         if (PyList_Check(body.get())) return PyList_GetSlice(body.get(), 0, PyList_GET_SIZE(body.get()));
         return body.release();
     });
@@ -218,9 +224,7 @@ PyObject* m_GetScopeDef(PyObject* self, PyObject* name) {
     return py::guarded([&]() -> PyObject* {
         Document& d = ready(self);
         BusyGuard busy(d);
-        return py::check(PyObject_CallMethod(d.cache.get(), const_cast<char*>("GetScopeDef"), const_cast<char*>("(O)"),
-                                             name))
-            .release();
+        return py::check(compat::callMethod(d.cache.get(), gImports.getScopeDef, name)).release();
     });
 }
 

@@ -135,8 +135,9 @@ void undoAll(Document& d, std::vector<Undo>& undo, const Damage& saved) {
 
 // Applies the batch to the text, keeping in `undo` what puts it back; on a
 // bad edit restores text, rows and damage and rethrows.
-void applyToText(Document& d, const std::vector<EditRequest>& requests, bool utf16, std::vector<Undo>& undo) {
+void applyToText(Document& d, EditRequests requests, bool utf16, std::vector<Undo>& undo) {
     const Damage saved = d.damage;
+    undo.reserve(requests.size());
     try {
         for (const EditRequest& request : requests) {
             size_t r0 = 0, r1 = 0;
@@ -234,13 +235,12 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
     }
     d.finder = py::check(PyObject_CallFunctionObjArgs(gImports.changeFinder, d.list.get(), nullptr));
     py::Ref none = py::check(PyList_New(0));
-    py::Ref whole = py::check(PyObject_CallMethod(d.finder.get(), const_cast<char*>("FindChanges"),
-                                                  const_cast<char*>("(OO)"), d.list.get(), none.get()));
+    py::Ref whole = py::check(compat::callMethod(d.finder.get(), gImports.findChanges, d.list.get(), none.get()));
     d.stats.findChangesCalled = true;
     d.cache = py::check(PyObject_CallFunctionObjArgs(gImports.bodyCache, d.list.get(), nullptr));
 }
 
-py::Ref applyEdits(Document& d, const std::vector<EditRequest>& requests, bool utf16) {
+py::Ref applyEdits(Document& d, EditRequests requests, bool utf16) {
     BusyGuard busy(d);
     const EditStats before = d.stats;
     d.stats = EditStats();

@@ -29,6 +29,10 @@ void bindImports() {
     gImports.logicalType = reinterpret_cast<PyTypeObject*>(type);
     gImports.emptyName = py::check(compat::internStr("")).release();
     gImports.syntaxError = PyExc_SyntaxError;
+    gImports.findChanges = py::check(compat::internStr("FindChanges")).release();
+    gImports.clear = py::check(compat::internStr("Clear")).release();
+    gImports.getBodyOfScope = py::check(compat::internStr("GetBodyOfScope")).release();
+    gImports.getScopeDef = py::check(compat::internStr("GetScopeDef")).release();
 }
 
 }  // namespace sdoc

@@ -137,6 +137,7 @@ Py_ssize_t lowerBoundNear(PyObject* list, Py_ssize_t lo, int64_t lineno) {
 // have changed since the last edit.
 std::vector<int64_t> stackAt(Document& d, size_t r, size_t unchangedAbove) {
     std::vector<int64_t> down;
+    down.reserve(32);
     int64_t limit = INT64_MAX;
     // The stack kept from the last edit holds while no row above its own
     // has changed since: the damage starts below it.
@@ -282,7 +283,7 @@ void clearCache(Document& d, PyObject* changes) {
     for (Py_ssize_t k = 0; k < 3; ++k) {
         PyObject* set = PyTuple_GET_ITEM(changes, k);
         if (PySet_GET_SIZE(set) == 0) continue;
-        py::check(PyObject_CallMethod(d.cache.get(), const_cast<char*>("Clear"), const_cast<char*>("(O)"), set));
+        py::check(compat::callMethod(d.cache.get(), gImports.clear, set));
     }
 }
 
@@ -299,9 +300,7 @@ void renameWhole(Document& d) noexcept {
     }
     PyObject* finder = PyObject_CallFunctionObjArgs(gImports.changeFinder, d.list.get(), nullptr);
     PyObject* none = finder ? PyList_New(0) : nullptr;
-    PyObject* named = none ? PyObject_CallMethod(finder, const_cast<char*>("FindChanges"), const_cast<char*>("(OO)"),
-                                                 d.list.get(), none)
-                           : nullptr;
+    PyObject* named = none ? compat::callMethod(finder, gImports.findChanges, d.list.get(), none) : nullptr;
     PyObject* cache = named ? PyObject_CallFunctionObjArgs(gImports.bodyCache, d.list.get(), nullptr) : nullptr;
     if (cache != nullptr) {
         d.finder = py::Ref::steal(finder);
@@ -359,6 +358,18 @@ py::Ref readWholeAs(Document& d, const void* source) {
     return makeLogicals(scanner, p, d);
 }
 
+// The scanner of one group's read scans into the document's buffers, and
+// hands them back when it goes: what an edit reads is small, so the buffers
+// are kept unless a read made them large.
+template <class Char>
+struct BuffersLent {
+    Scanner<Char>& scanner;
+    reader::ScanBuffers& buffers;
+    ~BuffersLent() { scanner.giveBack(buffers, 4096); }
+};
+template <class Char>
+BuffersLent(Scanner<Char>&, reader::ScanBuffers&) -> BuffersLent<Char>;
+
 // The rows read again for one or more damage ranges (a read that runs into
 // the next range takes it in), and what they read into.
 struct GroupRead {
@@ -389,7 +400,10 @@ void rereadAs(Document& d, EditOutcome& out) {
     const size_t rangeCount = ranges.size();
     // Where each range starts, and the first row after it (from there the
     // rows are the baseline's, shifted).
-    std::vector<size_t> startRow(rangeCount), afterRow(rangeCount);
+    std::vector<size_t>& startRow = d.scratch.startRow;
+    std::vector<size_t>& afterRow = d.scratch.afterRow;
+    startRow.resize(rangeCount);
+    afterRow.resize(rangeCount);
     for (size_t k = 0; k < rangeCount; ++k) {
         const bool known = ranges[k].startRow != kUnknownRow;
         startRow[k] = known ? ranges[k].startRow : rowOfOffset(d, ranges[k].start) - 1;
@@ -440,6 +454,8 @@ void rereadAs(Document& d, EditOutcome& out) {
         size_t end = windowEnd();
         const Char* p = static_cast<const Char*>(d.text.contiguous(base, end));
         Scanner<Char> scanner(p, end - base);
+        scanner.borrow(d.scratch.scan);
+        BuffersLent lent{scanner, d.scratch.scan};
         scanner.start(static_cast<int64_t>(G.first) + 1, 0, unpack(d.rows.state(G.first)), G.stack.data(),
                       G.stack.size());
         takeIn(j);
@@ -593,9 +609,8 @@ void rereadAs(Document& d, EditOutcome& out) {
     d.error.reset();
     d.damage = Damage();
 
-    py::Ref result = py::Ref::steal(PyObject_CallMethod(d.finder.get(), const_cast<char*>("FindChanges"),
-                                                        const_cast<char*>("(OO)"), out.added.get(),
-                                                        out.removed.get()));
+    py::Ref result =
+        py::Ref::steal(compat::callMethod(d.finder.get(), gImports.findChanges, out.added.get(), out.removed.get()));
     if (!result || !PyTuple_Check(result.get()) || PyTuple_GET_SIZE(result.get()) != 3) {
         // The list has moved on: rather than names of no text, the names of
         // a whole pass (a new finder and cache), and the error raised.
