@@ -144,13 +144,11 @@ std::vector<int64_t> stackAt(Document& d, size_t r, size_t unchangedAbove) {
     const StackCache& cache = d.stackCache;
     const bool cached = cache.valid && cache.row <= r && cache.row <= unchangedAbove;
     const size_t stop = cached ? cache.row : 0;
-    for (size_t j = r; j > stop && limit > 0;) {
-        --j;
-        const int16_t c = d.rows.column(j);
-        if (c >= 0 && c < limit) {
-            down.push_back(c);
-            limit = c;
-        }
+    for (size_t j = r; limit > 0;) {
+        j = d.rows.lastBelow(j, static_cast<int32_t>(std::min<int64_t>(limit, INT16_MAX + 1)));
+        if (j == RowTable::kNone || j < stop) break;
+        limit = d.rows.column(j);
+        down.push_back(limit);
     }
     if (limit > 0 && cached) {
         for (auto it = cache.stack.rbegin(); it != cache.stack.rend(); ++it) {
@@ -344,7 +342,7 @@ py::Ref readWholeAs(Document& d, const void* source) {
     size_t row = 0;
     d.rows.state(0) = pack(scanner.state());
     while (scanner.scanRow()) {
-        d.rows.column(row) = columnOf(scanner.rowIndentColumn());
+        d.rows.setColumn(row, columnOf(scanner.rowIndentColumn()));
         ++row;
         if (row < count) d.rows.state(row) = pack(scanner.state());
     }
@@ -595,12 +593,12 @@ void rereadAs(Document& d, EditOutcome& out) {
         // A row the scanner never reached (the empty one after a last '\n')
         // runs no check.
         for (size_t r = G.first; r < G.end; ++r) {
-            d.rows.column(r) = r - G.first < G.columns.size() ? G.columns[r - G.first] : kNoIndentCheck;
+            d.rows.setColumn(r, r - G.first < G.columns.size() ? G.columns[r - G.first] : kNoIndentCheck);
         }
         for (size_t r = G.first + 1; r < G.end && r - G.first - 1 < G.states.size(); ++r) {
             d.rows.state(r) = G.states[r - G.first - 1];
         }
-        if (G.stopped) d.rows.column(G.end - 1) = kNoIndentCheck;
+        if (G.stopped) d.rows.setColumn(G.end - 1, kNoIndentCheck);
     }
     d.stackCache.valid = true;
     d.stackCache.row = groups.front().first;

@@ -356,6 +356,35 @@ size_t RowTable::rowAt(size_t at) const noexcept {
     return firstRows_[c] + k - 1;
 }
 
+int16_t RowTable::Chunk::leastColumn() const noexcept {
+    if (!leastKnown) {
+        // As unsigned, a row with no column (negative) is above any column.
+        uint16_t m = UINT16_MAX;
+        for (const int16_t c : columns) m = std::min(m, static_cast<uint16_t>(c));
+        least = m > INT16_MAX ? INT16_MAX : static_cast<int16_t>(m);
+        leastKnown = true;
+    }
+    return least;
+}
+
+size_t RowTable::lastBelow(size_t r, int32_t limit) const noexcept {
+    if (r == 0) return kNone;
+    size_t c = chunkOf(r - 1);
+    size_t i = r - firstRows_[c];  // rows [0, i) of chunk c are above r
+    for (;;) {
+        const Chunk& chunk = chunks_[c];
+        if (i < chunk.size() || chunk.leastColumn() < limit) {
+            const int16_t* columns = chunk.columns.data();
+            while (i > 0) {
+                const int16_t v = columns[--i];
+                if (v >= 0 && v < limit) return firstRows_[c] + i;
+            }
+        }
+        if (c == 0) return kNone;
+        i = chunks_[--c].size();
+    }
+}
+
 void RowTable::renumber(size_t from) noexcept {
     firstRows_.resize(chunks_.size() + 1);
     firstRows_[0] = 0;
@@ -426,6 +455,7 @@ void RowTable::replace(size_t first, size_t removed, const std::vector<size_t>& 
     const size_t lastRemoved = first + removed;
     const size_t added = newStarts.size();
     Chunk& chunk = chunks_[c];
+    chunk.leastKnown = false;
     if (lastRemoved < firstRows_[c + 1]) {
         const size_t rows = chunk.size() - removed + added;
         const size_t after = chunk.size() - (k + 1 + removed);  // rows of the chunk below the edit

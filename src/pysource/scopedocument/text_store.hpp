@@ -143,14 +143,20 @@ public:
         const size_t c = chunkOf(r);
         return chunks_[c].states[r - firstRows_[c]];
     }
-    int16_t& column(size_t r) noexcept {
+    void setColumn(size_t r, int16_t column) noexcept {
         const size_t c = chunkOf(r);
-        return chunks_[c].columns[r - firstRows_[c]];
+        chunks_[c].columns[r - firstRows_[c]] = column;
+        chunks_[c].leastKnown = false;
     }
     int16_t column(size_t r) const noexcept {
         const size_t c = chunkOf(r);
         return chunks_[c].columns[r - firstRows_[c]];
     }
+    // The last row above row `r` whose column is at least 0 and below
+    // `limit`, or kNone: the indentation stack at a row, found without
+    // visiting every row of a long block above it.
+    static constexpr size_t kNone = static_cast<size_t>(-1);
+    size_t lastBelow(size_t r, int32_t limit) const noexcept;
     // The last row starting at or before character `at` (0-based).
     size_t rowAt(size_t at) const noexcept;
 
@@ -171,7 +177,11 @@ private:
         std::vector<uint16_t> offsets;  // from the chunk's base
         std::vector<RowState> states;
         std::vector<int16_t> columns;
+        // The least column at least 0 (INT16_MAX for none), while known.
+        mutable int16_t least = 0;
+        mutable bool leastKnown = false;
         size_t size() const noexcept { return offsets.size(); }
+        int16_t leastColumn() const noexcept;
     };
     // Rows laid out flat while chunks are cut again.
     struct Flat {
