@@ -51,9 +51,10 @@ void makeTokens(const Scanner<Char>& scanner, const Record& record, TokenMaker<C
 
 template <class Char>
 TokenMaker<Char>::TokenMaker(const Char* text, size_t length, bool ascii) : text_(text), ascii_(ascii) {
-    // About one distinct short token per 16 characters of text, at most 4096
-    // slots: a direct-mapped table that small stays in the caches.
-    size_t slots = 64;
+    // About one distinct short token per 16 characters of text, at least 16
+    // and at most 4096 slots: a direct-mapped table that small stays in the
+    // caches, and one for a line or two costs little to make and clear.
+    size_t slots = 16;
     while (slots < 4096 && slots * 16 < length) slots *= 2;
     mask_ = slots - 1;
     table_.reset(new Entry[slots]);

@@ -129,6 +129,11 @@ template <class Char>
 class Scanner {
 public:
     Scanner(const Char* text, size_t length) : text_(text), length_(length) { start(1, 0, LineState{}, nullptr, 0); }
+    // Scanning into `buffers`' vectors, to be handed back (giveBack).
+    Scanner(const Char* text, size_t length, ScanBuffers& buffers) : text_(text), length_(length) {
+        borrow(buffers);
+        start(1, 0, LineState{}, nullptr, 0);
+    }
 
     // Starts (again) at a row; indents null means the stack {0}. Output
     // vectors are cleared.
@@ -159,13 +164,8 @@ public:
     int64_t rowIndentColumn() const { return rowIndentColumn_; }
     const std::vector<int64_t>& indents() const { return indents_; }
 
-    // Scan into `b`'s vectors (call before start) and hand them back after;
-    // a vector grown past `keep` elements is freed rather than kept.
-    void borrow(ScanBuffers& b) noexcept {
-        indents_.swap(b.indents);
-        tokens_.swap(b.tokens);
-        records_.swap(b.records);
-    }
+    // Hands the borrowed vectors back; one grown past `keep` elements is
+    // freed rather than kept.
     void giveBack(ScanBuffers& b, size_t keep) noexcept {
         borrow(b);
         trim(b.indents, keep);
@@ -183,6 +183,11 @@ public:
     void clearOutput();
 
 private:
+    void borrow(ScanBuffers& b) noexcept {
+        indents_.swap(b.indents);
+        tokens_.swap(b.tokens);
+        records_.swap(b.records);
+    }
     template <class T>
     static void trim(std::vector<T>& v, size_t keep) noexcept {
         if (v.capacity() > keep) std::vector<T>().swap(v);

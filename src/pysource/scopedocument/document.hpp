@@ -51,6 +51,11 @@ struct Damage {
     bool baselineEndsWithNewline = false;
 
     bool active() const noexcept { return !ranges.empty(); }
+    void reset() noexcept {  // keeps the vector's room for the next edit
+        ranges.clear();
+        baselineRows = 0;
+        baselineEndsWithNewline = false;
+    }
     long lineDelta() const noexcept {
         long delta = 0;
         for (const DamageRange& r : ranges) delta += r.lineDelta;

@@ -216,7 +216,7 @@ void openDocument(Document& d, PyObject* source, PyObject* filename) {
     d.filename = py::Ref::own(filename);
     d.list = py::check(PyList_New(0));
     d.error.reset();
-    d.damage = Damage();
+    d.damage.reset();
     d.stats = EditStats();
     d.version = 0;
     py::Ref fresh = readWhole(d, chars.width == d.text.width() ? chars.data : nullptr);

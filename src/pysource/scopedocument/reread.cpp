@@ -271,6 +271,13 @@ void requireInOrder(PyObject* list, Py_ssize_t i0, Py_ssize_t i1) {
     }
 }
 
+// `items` (a list of its own) at the end of `list`; the first non-empty
+// one becomes the list.
+void appendTo(py::Ref& list, py::Ref items) {
+    if (PyList_GET_SIZE(list.get()) == 0) list = std::move(items);
+    else py::checkStatus(PyList_SetSlice(list.get(), PY_SSIZE_T_MAX, PY_SSIZE_T_MAX, items.get()));
+}
+
 void shiftLines(PyObject* list, Py_ssize_t from, Py_ssize_t to, long delta) {
     if (delta == 0) return;
     PyObject** items = &PyList_GET_ITEM(list, 0);
@@ -451,8 +458,7 @@ void rereadAs(Document& d, EditOutcome& out) {
         auto windowEnd = [&] { return G.first + windowRows >= count ? n : d.rows.start(G.first + windowRows, n); };
         size_t end = windowEnd();
         const Char* p = static_cast<const Char*>(d.text.contiguous(base, end));
-        Scanner<Char> scanner(p, end - base);
-        scanner.borrow(d.scratch.scan);
+        Scanner<Char> scanner(p, end - base, d.scratch.scan);
         BuffersLent lent{scanner, d.scratch.scan};
         scanner.start(static_cast<int64_t>(G.first) + 1, 0, unpack(d.rows.state(G.first)), G.stack.data(),
                       G.stack.size());
@@ -578,8 +584,8 @@ void rereadAs(Document& d, EditOutcome& out) {
         shiftLines(removed.get(), 0, PyList_GET_SIZE(removed.get()), delta);
         py::Ref added = py::check(PyList_GetSlice(fresh, head, m - tail));
         py::checkStatus(PyList_SetSlice(list, a0 + head, a1 - tail, added.get()));
-        py::checkStatus(PyList_SetSlice(out.removed.get(), PY_SSIZE_T_MAX, PY_SSIZE_T_MAX, removed.get()));
-        py::checkStatus(PyList_SetSlice(out.added.get(), PY_SSIZE_T_MAX, PY_SSIZE_T_MAX, added.get()));
+        appendTo(out.removed, std::move(removed));
+        appendTo(out.added, std::move(added));
         current = a0 + m;
         offset += m - (a1 - a0);
         delta += G.lineDelta;
@@ -605,7 +611,7 @@ void rereadAs(Document& d, EditOutcome& out) {
     d.stackCache.stack = std::move(groups.front().stack);
     d.readable = true;
     d.error.reset();
-    d.damage = Damage();
+    d.damage.reset();
 
     py::Ref result =
         py::Ref::steal(compat::callMethod(d.finder.get(), gImports.findChanges, out.added.get(), out.removed.get()));
