@@ -65,7 +65,7 @@ void noteNamesWritten(PyObject* list) noexcept {
 
 void noteStrayNamesWritten() noexcept { ++gStrayWrites; }
 
-DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(64, nullptr) {
+DefIndex::DefIndex(PyObject* list) : list_(py::Ref::own(list)), slots_(16, nullptr) {
     stamp_ = &stamps()[list];  // node-based: the address stays
     ++stamp_->indexes;
     seenWrites_ = stamp_->writes;

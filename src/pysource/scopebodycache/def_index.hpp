@@ -34,13 +34,14 @@ namespace sbc {
 template <class V>
 class PointerMap {
 public:
-    PointerMap() : slots_(16) {}
+    // No slots until the first key: most indexes never need one.
     size_t size() const noexcept { return used_; }
     void clear() {
-        slots_.assign(16, Slot());
+        std::vector<Slot>().swap(slots_);
         used_ = 0;
     }
     V* find(const void* key) noexcept {
+        if (slots_.empty()) return nullptr;
         const size_t mask = slots_.size() - 1;
         for (size_t i = home(key, mask);; i = (i + 1) & mask) {
             if (slots_[i].key == key) return &slots_[i].value;
@@ -57,6 +58,7 @@ public:
         ++used_;
     }
     bool erase(const void* key) noexcept {
+        if (slots_.empty()) return false;
         const size_t mask = slots_.size() - 1;
         size_t i = home(key, mask);
         while (slots_[i].key != key) {
@@ -98,7 +100,7 @@ private:
         slots_[i] = Slot{key, value};
     }
     void grow() {
-        std::vector<Slot> old(slots_.size() * 2);
+        std::vector<Slot> old(slots_.empty() ? 16 : slots_.size() * 2);
         old.swap(slots_);
         for (const Slot& s : old) {
             if (s.key != nullptr) place(s.key, s.value);

@@ -95,9 +95,11 @@ void readyEditResultType() {
 }
 
 py::Ref makeEditResult(Document& d, EditOutcome& out) {
-    py::Ref region = py::check(Py_BuildValue("(nnn)", static_cast<Py_ssize_t>(out.regionFirstLine),
-                                             static_cast<Py_ssize_t>(out.regionOldLines),
-                                             static_cast<Py_ssize_t>(out.regionNewLines)));
+    py::Ref region = py::check(PyTuple_New(3));
+    const size_t numbers[3] = {out.regionFirstLine, out.regionOldLines, out.regionNewLines};
+    for (Py_ssize_t k = 0; k < 3; ++k) {
+        PyTuple_SET_ITEM(region.get(), k, py::check(compat::intFromSsize(numbers[k])).release());
+    }
     py::Ref contents = setOrEmpty(out.changes.get(), 0);
     py::Ref classes = setOrEmpty(out.changes.get(), 1);
     py::Ref functions = setOrEmpty(out.changes.get(), 2);

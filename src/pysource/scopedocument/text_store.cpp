@@ -367,6 +367,14 @@ int16_t RowTable::Chunk::leastColumn() const noexcept {
     return least;
 }
 
+// Whether any of the 16 columns at `p` is at least 0 and below `limit`: as
+// unsigned, a row with no column (negative) is above any limit.
+[[gnu::optimize("tree-vectorize")]] static bool anyBelow16(const int16_t* p, int32_t limit) noexcept {
+    uint16_t m = UINT16_MAX;
+    for (size_t k = 0; k < 16; ++k) m = std::min(m, static_cast<uint16_t>(p[k]));
+    return m < limit;
+}
+
 size_t RowTable::lastBelow(size_t r, int32_t limit) const noexcept {
     if (r == 0) return kNone;
     size_t c = chunkOf(r - 1);
@@ -375,6 +383,7 @@ size_t RowTable::lastBelow(size_t r, int32_t limit) const noexcept {
         const Chunk& chunk = chunks_[c];
         if (i < chunk.size() || chunk.leastColumn() < limit) {
             const int16_t* columns = chunk.columns.data();
+            while (i >= 16 && !anyBelow16(columns + i - 16, limit)) i -= 16;
             while (i > 0) {
                 const int16_t v = columns[--i];
                 if (v >= 0 && v < limit) return firstRows_[c] + i;
