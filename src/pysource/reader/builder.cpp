@@ -137,7 +137,10 @@ template <class Char>
 void setScanError(const Scanner<Char>& scanner, TokenMaker<Char>& tokens, PyObject* filename) {
     const ScanError& error = scanner.error();
     py::guarded([&]() -> PyObject* {
-        py::Ref text = error.hasText ? py::check(tokens.makeFresh(error.textBegin, error.textEnd)) : py::Ref::none();
+        size_t begin = error.textBegin, end = error.textEnd;
+        const bool hasText = error.lineText ? splitLine(scanner.text(), scanner.length(), error.lineno, &begin, &end)
+                                            : error.hasText;
+        py::Ref text = hasText ? py::check(tokens.makeFresh(begin, end)) : py::Ref::none();
         PyObject* type = error.isIndentation() ? PyExc_IndentationError : PyExc_SyntaxError;
         py::Ref args = py::check(Py_BuildValue("(s(OnnO))", error.message(), filename,
                                                static_cast<Py_ssize_t>(error.lineno),

@@ -156,7 +156,8 @@ void checkResumeAt(const Scanner<Char>& whole, const Boundary& at, const Char* d
     const reader::ScanError& we = whole.error();
     const reader::ScanError& pe = part.error();
     same = same && we.kind == pe.kind && we.lineno == pe.lineno && we.offset == pe.offset &&
-           we.hasText == pe.hasText && we.textBegin == pe.textBegin && we.textEnd == pe.textEnd;
+           we.hasText == pe.hasText && we.textBegin == pe.textBegin && we.textEnd == pe.textEnd &&
+           we.lineText == pe.lineText;
     if (!same) {
         PyErr_Format(PyExc_AssertionError, "a scan resumed at row %lld reads otherwise than the whole scan",
                      static_cast<long long>(at.lineno));

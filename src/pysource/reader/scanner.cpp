@@ -551,7 +551,7 @@ void Scanner<Char>::failAtEof(ErrorKind kind, int64_t lineno, int64_t offset) {
     error_.kind = kind;
     error_.lineno = lineno;
     error_.offset = offset;
-    error_.hasText = splitLine(text_, length_, lineno, &error_.textBegin, &error_.textEnd);
+    error_.lineText = true;
 }
 
 template <class Char>

@@ -110,6 +110,11 @@ struct ScanError {
     bool hasText = false;
     size_t textBegin = 0;
     size_t textEnd = 0;
+    // At an end of text the text is line `lineno` of the text scanned, split
+    // at '\r\n', '\r' and '\n': found by splitLine when it is wanted (a
+    // document finds it in its own way, and a window's lines are not the
+    // text's).
+    bool lineText = false;
 
     explicit operator bool() const { return kind != ErrorKind::kNone; }
     const char* message() const;
