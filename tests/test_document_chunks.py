@@ -88,6 +88,30 @@ class LongRowsTest(unittest.TestCase):
         Agrees(self, doc, text)
 
 
+class LongReadsTest(unittest.TestCase):
+    """A bracket opened near the top runs the read through megabytes of
+    text, window after window, to its end and back."""
+
+    def testBracketOpenedAndClosedOverALargeText(self):
+        body = ''.join('def f%d(a, b):\n    return a + b * %d\n\n' % (i, i) for i in range(30000))
+        text = 'import os\n' + body + 'x = 1\n'  # over a megabyte
+        doc = CScopeDocument(text, 'c.py')
+        for _ in range(2):
+            opened = doc.Edit(2, 0, 2, 0, '(')
+            self.assertFalse(opened.fReadable)
+            text = text[:10] + '(' + text[10:]
+            Agrees(self, doc, text)
+            lines = doc.GetLineCount()
+            closed = doc.Edit(lines - 1, 5, lines - 1, 5, ')')
+            text = text[:-1] + ')\n'
+            self.assertTrue(closed.fReadable)
+            Agrees(self, doc, text)
+            doc.Edit(lines - 1, 5, lines - 1, 6, '')
+            doc.Edit(2, 0, 2, 1, '')
+            text = text[:10] + text[11:-2] + '\n'
+            Agrees(self, doc, text)
+
+
 class DeepBracketsTest(unittest.TestCase):
     """Rows deeper in brackets than a row's state holds, and rows after more
     stray closers than it holds: read again, never taken as unchanged."""

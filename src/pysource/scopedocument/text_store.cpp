@@ -1,5 +1,9 @@
 #include "pysource/scopedocument/text_store.hpp"
 
+#ifdef __linux__
+#include <sys/mman.h>
+#endif
+
 #include "common/pycompat.hpp"
 
 #include <algorithm>
@@ -107,6 +111,7 @@ void TextStore::restart(size_t from) noexcept {
 }
 
 void TextStore::assign(const void* data, int width, size_t n) {
+    copyStart_ = copyEnd_ = 0;
     requireFits(n);
     const int need = widestIn(data, width, n, 1);
     size_t crs = 0;
@@ -178,6 +183,7 @@ void TextStore::mergeIfSmall(size_t c) {
 }
 
 void TextStore::replace(size_t start, size_t end, const void* data, int width, size_t n) {
+    copyStart_ = copyEnd_ = 0;
     requireFits(size_ - (end - start) + n);
     if (width > width_) {
         const int need = widestIn(data, width, n, width_);
@@ -223,9 +229,13 @@ const void* TextStore::contiguous(size_t start, size_t end) {
     const size_t w = static_cast<size_t>(width_);
     const size_t c0 = chunkOf(start);
     if (end <= starts_[c0 + 1] || start == end) return chunks_[c0].data() + (start - starts_[c0]) * w;
-    copy_.resize((end - start) * w);
-    copyChars(start, end, copy_.data());
-    return copy_.data();
+    const bool extends = copyEnd_ > copyStart_ && copyStart_ == start && copyEnd_ <= end;
+    const size_t from = extends ? copyEnd_ : start;
+    uint8_t* out = copy_.reserve((end - start) * w);
+    copyChars(from, end, out + (from - start) * w);
+    copyStart_ = start;
+    copyEnd_ = end;
+    return out;
 }
 
 void TextStore::copyChars(size_t start, size_t end, uint8_t* out) const noexcept {
@@ -239,7 +249,8 @@ void TextStore::copyChars(size_t start, size_t end, uint8_t* out) const noexcept
 void TextStore::releaseCopy() noexcept {
     // A typing edit's few rows may keep theirs; a document at rest holds
     // no more than that.
-    if (copy_.capacity() > 2048) Chunk().swap(copy_);
+    copyStart_ = copyEnd_ = 0;
+    if (copy_.capacity() > 2048) copy_.release();
 }
 
 void TextStore::copyOut(size_t start, size_t end, std::vector<uint32_t>& out) const {
@@ -327,6 +338,50 @@ size_t TextStore::bytesHeld() const noexcept {
     size_t held = chunks_.capacity() * sizeof(Chunk) + starts_.capacity() * sizeof(size_t) + copy_.capacity();
     for (const Chunk& c : chunks_) held += c.capacity();
     return held;
+}
+
+// --- CopyBuffer ------------------------------------------------------------------
+
+namespace {
+constexpr size_t kMapFrom = size_t{1} << 20;
+}
+
+uint8_t* CopyBuffer::reserve(size_t n) {
+    if (n <= capacity_) return data_;
+#ifdef __linux__
+    if (n >= kMapFrom) {
+        const size_t page = 4096;
+        const size_t bytes = (n + n / 8 + page - 1) / page * page;
+        void* p = mapped_ ? mremap(data_, capacity_, bytes, MREMAP_MAYMOVE)
+                          : mmap(nullptr, bytes, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+        if (p == MAP_FAILED) throw std::bad_alloc();
+        if (!mapped_) {
+            if (data_ != nullptr) std::memcpy(p, data_, capacity_);
+            std::free(data_);
+        }
+        data_ = static_cast<uint8_t*>(p);
+        capacity_ = bytes;
+        mapped_ = true;
+        return data_;
+    }
+#endif
+    void* p = std::realloc(data_, n);
+    if (p == nullptr) throw std::bad_alloc();
+    data_ = static_cast<uint8_t*>(p);
+    capacity_ = n;
+    return data_;
+}
+
+void CopyBuffer::release() noexcept {
+#ifdef __linux__
+    if (mapped_) munmap(data_, capacity_);
+    else std::free(data_);
+#else
+    std::free(data_);
+#endif
+    data_ = nullptr;
+    capacity_ = 0;
+    mapped_ = false;
 }
 
 // --- RowTable ------------------------------------------------------------------

@@ -21,7 +21,9 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
+#include <new>
 #include <vector>
 
 namespace sdoc {
@@ -34,6 +36,28 @@ inline uint32_t charOf(const void* data, int width, size_t i) noexcept {
     default: return static_cast<const uint32_t*>(data)[i];
     }
 }
+
+// Bytes that a copy of characters lives in. A large one is mapped apart
+// from the heap and grows in place (the kernel moves its pages): freed, a
+// block of the heap that large would teach the allocator to hand back, and
+// fault in again, the larger blocks of the next long read.
+class CopyBuffer {
+public:
+    CopyBuffer() = default;
+    ~CopyBuffer() { release(); }
+    CopyBuffer(const CopyBuffer&) = delete;
+    CopyBuffer& operator=(const CopyBuffer&) = delete;
+    uint8_t* data() const noexcept { return data_; }
+    size_t capacity() const noexcept { return capacity_; }
+    // Room for `n` bytes, the ones held kept.
+    uint8_t* reserve(size_t n);
+    void release() noexcept;
+
+private:
+    uint8_t* data_ = nullptr;
+    size_t capacity_ = 0;
+    bool mapped_ = false;
+};
 
 class TextStore {
 public:
@@ -53,7 +77,9 @@ public:
     void replace(size_t start, size_t end, const void* data, int width, size_t n);
     // Characters [start, end) one after the other at the returned address
     // (width() bytes each): in place when one chunk holds them, else a copy
-    // that lasts until the next call or edit.
+    // that lasts until the next call or edit. A call from the same start
+    // with a later end (a read that outgrew its window) copies only what
+    // the last copy did not hold.
     const void* contiguous(size_t start, size_t end);
     // Lets a large copy go once its reader is done with it.
     void releaseCopy() noexcept;
@@ -105,7 +131,8 @@ private:
     int width_ = 1;
     size_t size_ = 0;
     size_t carriageReturns_ = 0;
-    std::vector<uint8_t> copy_;
+    CopyBuffer copy_;
+    size_t copyStart_ = 0, copyEnd_ = 0;  // what copy_ holds, until an edit
 };
 
 // Chunks of about `chars` characters and `rows` rows from now on (tests
