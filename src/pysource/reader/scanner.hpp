@@ -37,6 +37,8 @@
 // blank or comment row), else -1.
 #pragma once
 
+#include "common/grow_buffer.hpp"
+
 #include <cstddef>
 #include <cstdint>
 #include <vector>
@@ -126,7 +128,7 @@ struct ScanError {
 // often (a document at each edit), so that a scan need not allocate them.
 struct ScanBuffers {
     std::vector<int64_t> indents;
-    std::vector<TokenSpan> tokens;
+    PodVector<TokenSpan> tokens;
     std::vector<Record> records;
 };
 
@@ -178,7 +180,7 @@ public:
         trim(b.records, keep);
     }
 
-    const std::vector<TokenSpan>& tokens() const { return tokens_; }
+    const PodVector<TokenSpan>& tokens() const { return tokens_; }
     const std::vector<Record>& records() const { return records_; }
     const ScanError& error() const { return error_; }
     const Char* text() const { return text_; }
@@ -196,6 +198,11 @@ private:
     template <class T>
     static void trim(std::vector<T>& v, size_t keep) noexcept {
         if (v.capacity() > keep) std::vector<T>().swap(v);
+        v.clear();
+    }
+    template <class T>
+    static void trim(PodVector<T>& v, size_t keep) noexcept {
+        if (v.capacity() > keep) v.release();
         v.clear();
     }
     void addToken(size_t begin, size_t end, int64_t lineno, size_t rowStart, size_t column);
@@ -235,7 +242,7 @@ private:
     size_t firstColumn_ = 0;
     int64_t rowIndentColumn_ = -1;
     std::vector<int64_t> indents_;
-    std::vector<TokenSpan> tokens_;
+    PodVector<TokenSpan> tokens_;  // a long read's many: grown in place
     std::vector<Record> records_;
     ScanError error_;
 };

@@ -1,9 +1,5 @@
 #include "pysource/scopedocument/text_store.hpp"
 
-#ifdef __linux__
-#include <sys/mman.h>
-#endif
-
 #include "common/pycompat.hpp"
 
 #include <algorithm>
@@ -338,50 +334,6 @@ size_t TextStore::bytesHeld() const noexcept {
     size_t held = chunks_.capacity() * sizeof(Chunk) + starts_.capacity() * sizeof(size_t) + copy_.capacity();
     for (const Chunk& c : chunks_) held += c.capacity();
     return held;
-}
-
-// --- CopyBuffer ------------------------------------------------------------------
-
-namespace {
-constexpr size_t kMapFrom = size_t{1} << 20;
-}
-
-uint8_t* CopyBuffer::reserve(size_t n) {
-    if (n <= capacity_) return data_;
-#ifdef __linux__
-    if (n >= kMapFrom) {
-        const size_t page = 4096;
-        const size_t bytes = (n + n / 8 + page - 1) / page * page;
-        void* p = mapped_ ? mremap(data_, capacity_, bytes, MREMAP_MAYMOVE)
-                          : mmap(nullptr, bytes, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
-        if (p == MAP_FAILED) throw std::bad_alloc();
-        if (!mapped_) {
-            if (data_ != nullptr) std::memcpy(p, data_, capacity_);
-            std::free(data_);
-        }
-        data_ = static_cast<uint8_t*>(p);
-        capacity_ = bytes;
-        mapped_ = true;
-        return data_;
-    }
-#endif
-    void* p = std::realloc(data_, n);
-    if (p == nullptr) throw std::bad_alloc();
-    data_ = static_cast<uint8_t*>(p);
-    capacity_ = n;
-    return data_;
-}
-
-void CopyBuffer::release() noexcept {
-#ifdef __linux__
-    if (mapped_) munmap(data_, capacity_);
-    else std::free(data_);
-#else
-    std::free(data_);
-#endif
-    data_ = nullptr;
-    capacity_ = 0;
-    mapped_ = false;
 }
 
 // --- RowTable ------------------------------------------------------------------

@@ -19,11 +19,11 @@
 
 #include <Python.h>
 
+#include "common/grow_buffer.hpp"
+
 #include <algorithm>
 #include <cstdint>
-#include <cstdlib>
 #include <cstring>
-#include <new>
 #include <vector>
 
 namespace sdoc {
@@ -36,28 +36,6 @@ inline uint32_t charOf(const void* data, int width, size_t i) noexcept {
     default: return static_cast<const uint32_t*>(data)[i];
     }
 }
-
-// Bytes that a copy of characters lives in. A large one is mapped apart
-// from the heap and grows in place (the kernel moves its pages): freed, a
-// block of the heap that large would teach the allocator to hand back, and
-// fault in again, the larger blocks of the next long read.
-class CopyBuffer {
-public:
-    CopyBuffer() = default;
-    ~CopyBuffer() { release(); }
-    CopyBuffer(const CopyBuffer&) = delete;
-    CopyBuffer& operator=(const CopyBuffer&) = delete;
-    uint8_t* data() const noexcept { return data_; }
-    size_t capacity() const noexcept { return capacity_; }
-    // Room for `n` bytes, the ones held kept.
-    uint8_t* reserve(size_t n);
-    void release() noexcept;
-
-private:
-    uint8_t* data_ = nullptr;
-    size_t capacity_ = 0;
-    bool mapped_ = false;
-};
 
 class TextStore {
 public:
@@ -131,7 +109,7 @@ private:
     int width_ = 1;
     size_t size_ = 0;
     size_t carriageReturns_ = 0;
-    CopyBuffer copy_;
+    GrowBuffer copy_;
     size_t copyStart_ = 0, copyEnd_ = 0;  // what copy_ holds, until an edit
 };
 
