@@ -46,7 +46,8 @@ Then creating a document (per line) and the memory a document keeps beyond
 its logicals, in bytes per line: the RSS a child process gains by making
 the document, less the RSS another child gains by reading the same text
 into named logicals (freed memory handed back with malloc_trim before each
-reading; copies of the smaller files held at once, ~100k lines in all).
+reading; copies of the smaller files held at once, ~100k lines in all, and
+three of the largest).
 The text the document keeps is shown apart. Targets are printed
 beside the figures.
 """
@@ -383,8 +384,9 @@ def CharWidth(text):
 
 
 def MemoryPerLine(text, kinds):
-    # Many copies of a small file, so that the pools' slack is small beside them.
-    copies = max(1, 100000 // (text.count('\n') + 1))
+    # Many copies of a small file, so that the pools' slack is small beside
+    # them; of a large one three, so that one process's own growth is too.
+    copies = max(3, 100000 // (text.count('\n') + 1))
     handle, text_path = tempfile.mkstemp(suffix='.py')
     with os.fdopen(handle, 'wb') as f:
         f.write(text if kPy2 else text.encode('utf-8'))
