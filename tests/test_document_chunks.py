@@ -176,5 +176,42 @@ class WholeTextTest(unittest.TestCase):
         self.assertEqual(doc.GetLine(1), narrow.split('\n')[0])
 
 
+class RoomTest(unittest.TestCase):
+    """A chunk keeps room where it was last edited: edits that take it from
+    place to place within a chunk, and reads, lines, whole texts, wider
+    characters and pickles that meet it there."""
+
+    def testRoomMovesWithTheEdits(self):
+        import pickle
+        rng = Random(11)
+        text = ''.join('def f%d(a):\n    return a + %d\n' % (i, i) for i in range(60))
+        doc = CScopeDocument(text, 'c.py')
+        places = [text.index('return', k * len(text) // 6) for k in range(6)]
+        for step in range(200):
+            at = places[rng.randrange(len(places))] + rng.randrange(3)
+            if rng.random() < 0.5:
+                new, cut = rng.choice(['x', ' ', '\n', '(', ')', '"""', '#', '  ']), 0
+            else:
+                new, cut = '', rng.randrange(1, 3)
+            cut = min(cut, len(text) - at)
+            line, column = Place(text, at)
+            end_line, end_column = Place(text, at + cut)
+            doc.Edit(line, column, end_line, end_column, new)
+            text = text[:at] + new + text[at + cut:]
+            places = [p + len(new) - cut if p > at else p for p in places]
+            if step % 20 == 0:
+                Agrees(self, doc, text)
+                self.assertEqual([doc.GetLine(n) for n in range(1, doc.GetLineCount() + 1)], text.split('\n'))
+                self.assertEqual(pickle.loads(pickle.dumps(doc)).GetText(), text)
+        Agrees(self, doc, text)
+        if kPy3:
+            text = text[:40] + u'\u4e2d' + text[40:]
+            doc.SetText(text)
+            Agrees(self, doc, text)
+        text = text.replace('return', 'yield')
+        doc.SetText(text)
+        Agrees(self, doc, text)
+
+
 if __name__ == '__main__':
     unittest.main()

@@ -117,8 +117,10 @@ void TextStore::assign(const void* data, int width, size_t n) {
     const size_t w = static_cast<size_t>(need);
     for (size_t at = 0; at < n || fresh.empty(); at += gChunkChars) {
         const size_t k = std::min(gChunkChars, n - at);
-        Chunk chunk(k * w);
-        put(chunk.data(), need, static_cast<const uint8_t*>(data) + at * static_cast<size_t>(width), width, k);
+        Chunk chunk;
+        chunk.bytes.resize(k * w);
+        chunk.gap = k;
+        put(chunk.bytes.data(), need, static_cast<const uint8_t*>(data) + at * static_cast<size_t>(width), width, k);
         fresh.push_back(std::move(chunk));
     }
     chunks_.swap(fresh);
@@ -127,17 +129,32 @@ void TextStore::assign(const void* data, int width, size_t n) {
     restart(0);
 }
 
+void TextStore::moveGap(Chunk& c, size_t k) noexcept {
+    const size_t w = static_cast<size_t>(width_);
+    uint8_t* p = c.bytes.data();
+    if (k < c.gap) std::memmove(p + (k + c.room) * w, p + k * w, (c.gap - k) * w);
+    else if (k > c.gap) std::memmove(p + c.gap * w, p + (c.gap + c.room) * w, (k - c.gap) * w);
+    c.gap = k;
+}
+
+void TextStore::closeGap(Chunk& c) noexcept {
+    moveGap(c, chars(c));
+    c.bytes.resize(c.gap * static_cast<size_t>(width_));
+    c.room = 0;
+}
+
 void TextStore::widen(int width) {
     for (Chunk& chunk : chunks_) {
+        closeGap(chunk);
         const size_t k = chars(chunk);
-        Chunk wide(k * static_cast<size_t>(width));
-        put(wide.data(), width, chunk.data(), width_, k);
-        chunk.swap(wide);
+        Bytes wide(k * static_cast<size_t>(width));
+        put(wide.data(), width, chunk.bytes.data(), width_, k);
+        chunk.bytes.swap(wide);
     }
     width_ = width;
 }
 
-void TextStore::rechunk(size_t first, size_t last, const Chunk& joined) {
+void TextStore::rechunk(size_t first, size_t last, const Bytes& joined) {
     const size_t w = static_cast<size_t>(width_);
     const size_t m = joined.size() / w;
     std::vector<Chunk> pieces;
@@ -146,8 +163,10 @@ void TextStore::rechunk(size_t first, size_t last, const Chunk& joined) {
         const size_t each = (m + count - 1) / count;
         for (size_t at = 0; at < m; at += each) {
             const size_t k = std::min(each, m - at);
-            Chunk piece(joined.begin() + static_cast<std::ptrdiff_t>(at * w),
-                        joined.begin() + static_cast<std::ptrdiff_t>((at + k) * w));
+            Chunk piece;
+            piece.bytes.assign(joined.begin() + static_cast<std::ptrdiff_t>(at * w),
+                               joined.begin() + static_cast<std::ptrdiff_t>((at + k) * w));
+            piece.gap = k;
             pieces.push_back(std::move(piece));
         }
     }
@@ -172,8 +191,12 @@ void TextStore::mergeIfSmall(size_t c) {
         restart(c > 0 ? c - 1 : 0);
         return;
     }
-    roomFor(chunks_[lo], chunks_[hi].size());
-    chunks_[lo].insert(chunks_[lo].end(), chunks_[hi].begin(), chunks_[hi].end());
+    closeGap(chunks_[lo]);
+    closeGap(chunks_[hi]);
+    Bytes& into = chunks_[lo].bytes;
+    roomFor(into, chunks_[hi].bytes.size());
+    into.insert(into.end(), chunks_[hi].bytes.begin(), chunks_[hi].bytes.end());
+    chunks_[lo].gap = chars(chunks_[lo]);
     chunks_.erase(chunks_.begin() + static_cast<std::ptrdiff_t>(hi));
     restart(lo);
 }
@@ -193,38 +216,52 @@ void TextStore::replace(size_t start, size_t end, const void* data, int width, s
     });
     for (size_t i = 0; i < n; ++i) carriageReturns_ += charOf(data, width, i) == '\r';
 
-    const size_t off0 = (start - starts_[c0]) * w;
-    const size_t off1 = (end - starts_[c1]) * w;
+    const size_t k0 = start - starts_[c0];
+    const size_t k1 = end - starts_[c1];
     if (c0 == c1 && chars(chunks_[c0]) - (end - start) + n <= gMaxChunkChars) {
-        // Within one chunk: its tail moves, the chunks after start later.
+        // Within one chunk: its room moves to the edit (nothing moves when
+        // it is there already), the chunks after start later.
         Chunk& chunk = chunks_[c0];
-        const size_t oldBytes = chunk.size();
-        const size_t newBytes = oldBytes - (off1 - off0) + n * w;
-        if (newBytes > oldBytes) {
-            roomFor(chunk, newBytes - oldBytes);
-            chunk.resize(newBytes);
+        moveGap(chunk, k0);
+        chunk.room += k1 - k0;
+        if (chunk.room < n) {
+            // Room for this and the next few, a sixteenth of the chunk.
+            const size_t kept = chars(chunk);
+            const size_t room = n + 16 + kept / 16;
+            Bytes grown((kept + room) * w);
+            std::memcpy(grown.data(), chunk.bytes.data(), chunk.gap * w);
+            std::memcpy(grown.data() + (chunk.gap + room) * w, chunk.bytes.data() + (chunk.gap + chunk.room) * w,
+                        (kept - chunk.gap) * w);
+            chunk.bytes.swap(grown);
+            chunk.room = room;
         }
-        if (oldBytes > off1) std::memmove(chunk.data() + off0 + n * w, chunk.data() + off1, oldBytes - off1);
-        if (newBytes < oldBytes) chunk.resize(newBytes);
-        put(chunk.data() + off0, width_, data, width, n);
+        put(chunk.bytes.data() + chunk.gap * w, width_, data, width, n);
+        chunk.gap += n;
+        chunk.room -= n;
         addToEach(starts_.data() + c0 + 1, starts_.size() - c0 - 1, n - (end - start));
         size_ = starts_.back();
-        if (newBytes / w < gMinChunkChars) mergeIfSmall(c0);
+        if (chars(chunk) < gMinChunkChars) mergeIfSmall(c0);
         return;
     }
-    Chunk joined;
-    joined.reserve(off0 + n * w + (chunks_[c1].size() - off1));
-    joined.insert(joined.end(), chunks_[c0].begin(), chunks_[c0].begin() + static_cast<std::ptrdiff_t>(off0));
+    closeGap(chunks_[c0]);
+    closeGap(chunks_[c1]);
+    const Bytes& head = chunks_[c0].bytes;
+    const Bytes& tail = chunks_[c1].bytes;
+    const size_t off0 = k0 * w;
+    const size_t off1 = k1 * w;
+    Bytes joined;
+    joined.reserve(off0 + n * w + (tail.size() - off1));
+    joined.insert(joined.end(), head.begin(), head.begin() + static_cast<std::ptrdiff_t>(off0));
     joined.resize(off0 + n * w);
     put(joined.data() + off0, width_, data, width, n);
-    joined.insert(joined.end(), chunks_[c1].begin() + static_cast<std::ptrdiff_t>(off1), chunks_[c1].end());
+    joined.insert(joined.end(), tail.begin() + static_cast<std::ptrdiff_t>(off1), tail.end());
     rechunk(c0, c1, joined);
 }
 
 const void* TextStore::contiguous(size_t start, size_t end) {
     const size_t w = static_cast<size_t>(width_);
     const size_t c0 = chunkOf(start);
-    if (end <= starts_[c0 + 1] || start == end) return chunks_[c0].data() + (start - starts_[c0]) * w;
+    if (const uint8_t* p = inPlace(c0, start, end)) return p;
     const bool extends = copyEnd_ > copyStart_ && copyStart_ == start && copyEnd_ <= end;
     const size_t from = extends ? copyEnd_ : start;
     uint8_t* out = copy_.reserve((end - start) * w);
@@ -232,6 +269,15 @@ const void* TextStore::contiguous(size_t start, size_t end) {
     copyStart_ = start;
     copyEnd_ = end;
     return out;
+}
+
+const uint8_t* TextStore::inPlace(size_t c, size_t start, size_t end) const noexcept {
+    const Chunk& chunk = chunks_[c];
+    const size_t k0 = start - starts_[c];
+    const size_t k1 = end - starts_[c];
+    if (start == end) return chunk.bytes.data();
+    if (end > starts_[c + 1] || (k0 < chunk.gap && k1 > chunk.gap)) return nullptr;
+    return base(chunk, k0) + k0 * static_cast<size_t>(width_);
 }
 
 void TextStore::copyChars(size_t start, size_t end, uint8_t* out) const noexcept {
@@ -259,9 +305,8 @@ void TextStore::copyOut(size_t start, size_t end, std::vector<uint32_t>& out) co
 PyObject* TextStore::slice(size_t start, size_t end) {
     const size_t w = static_cast<size_t>(width_);
     const size_t c0 = chunkOf(start);
-    if (end <= starts_[c0 + 1] || start == end) {
-        return py::check(compat::strFromWidth(chunks_[c0].data() + (start - starts_[c0]) * w, width_, end - start))
-            .release();
+    if (const uint8_t* p = inPlace(c0, start, end)) {
+        return py::check(compat::strFromWidth(p, width_, end - start)).release();
     }
     // Not through the copy: a reader may still be using it.
     std::vector<uint8_t> joined((end - start) * w);
@@ -271,28 +316,39 @@ PyObject* TextStore::slice(size_t start, size_t end) {
 
 size_t TextStore::findNewline(size_t from) const noexcept {
     if (from >= size_) return size_;
-    for (size_t c = chunkOf(from); c < chunks_.size(); ++c) {
-        const uint8_t* p = chunks_[c].data();
-        const size_t k0 = from > starts_[c] ? from - starts_[c] : 0;
-        const size_t k1 = chars(chunks_[c]);
+    // Characters [k0, k1) of chunk c, at p + k * width: the index of the
+    // first '\n', or k1.
+    const auto search = [&](const uint8_t* p, size_t k0, size_t k1) {
         if (width_ == 1) {
             const void* hit = k0 < k1 ? std::memchr(p + k0, '\n', k1 - k0) : nullptr;
-            if (hit) return starts_[c] + static_cast<size_t>(static_cast<const uint8_t*>(hit) - p);
-        } else {
-            for (size_t k = k0; k < k1; ++k) {
-                if (charAt(p, k) == '\n') return starts_[c] + k;
-            }
+            return hit ? static_cast<size_t>(static_cast<const uint8_t*>(hit) - p) : k1;
         }
+        for (size_t k = k0; k < k1; ++k) {
+            if (charAt(p, k) == '\n') return k;
+        }
+        return k1;
+    };
+    for (size_t c = chunkOf(from); c < chunks_.size(); ++c) {
+        const Chunk& chunk = chunks_[c];
+        const size_t k0 = from > starts_[c] ? from - starts_[c] : 0;
+        const size_t k1 = chars(chunk);
+        if (k0 < chunk.gap) {
+            const size_t k = search(chunk.bytes.data(), k0, std::min(k1, chunk.gap));
+            if (k < std::min(k1, chunk.gap)) return starts_[c] + k;
+        }
+        const size_t k = search(base(chunk, chunk.gap), std::max(k0, chunk.gap), k1);
+        if (k < k1) return starts_[c] + k;
     }
     return size_;
 }
 
-size_t TextStore::commonPrefix(const void* data, int width, size_t n) const noexcept {
+size_t TextStore::commonPrefix(const void* data, int width, size_t n) noexcept {
+    for (Chunk& chunk : chunks_) closeGap(chunk);  // a whole text compared: the rooms go
     const size_t limit = std::min(size_, n);
     const size_t w = static_cast<size_t>(width_);
     size_t i = 0;
     for (size_t c = 0; c < chunks_.size() && i < limit; ++c) {
-        const uint8_t* p = chunks_[c].data();
+        const uint8_t* p = chunks_[c].bytes.data();
         const size_t len = std::min(chars(chunks_[c]), limit - i);
         size_t k = 0;
         if (width == width_) {
@@ -306,12 +362,13 @@ size_t TextStore::commonPrefix(const void* data, int width, size_t n) const noex
     return i;
 }
 
-size_t TextStore::commonSuffix(const void* data, int width, size_t n, size_t skip) const noexcept {
+size_t TextStore::commonSuffix(const void* data, int width, size_t n, size_t skip) noexcept {
+    for (Chunk& chunk : chunks_) closeGap(chunk);
     const size_t limit = std::min(size_, n) - std::min(skip, std::min(size_, n));
     const size_t w = static_cast<size_t>(width_);
     size_t t = 0;  // characters matched from the end
     for (size_t c = chunks_.size(); c-- > 0 && t < limit;) {
-        const uint8_t* p = chunks_[c].data();
+        const uint8_t* p = chunks_[c].bytes.data();
         const size_t have = chars(chunks_[c]);
         const size_t len = std::min(have, limit - t);
         // Compares p[have-1-k] with data[n-1-t-k] for k < len.
@@ -332,7 +389,7 @@ size_t TextStore::commonSuffix(const void* data, int width, size_t n, size_t ski
 
 size_t TextStore::bytesHeld() const noexcept {
     size_t held = chunks_.capacity() * sizeof(Chunk) + starts_.capacity() * sizeof(size_t) + copy_.capacity();
-    for (const Chunk& c : chunks_) held += c.capacity();
+    for (const Chunk& c : chunks_) held += c.bytes.capacity();
     return held;
 }
 

@@ -46,7 +46,8 @@ public:
 
     uint32_t at(size_t i) const noexcept {
         const size_t c = chunkOf(i);
-        return charAt(chunks_[c].data(), i - starts_[c]);
+        const size_t k = i - starts_[c];
+        return charAt(base(chunks_[c], k), k);
     }
 
     // The whole text becomes `n` characters of `width` bytes at `data`.
@@ -69,29 +70,52 @@ public:
     size_t findNewline(size_t from) const noexcept;
     // How many characters the text and the `n` at `data` share at the
     // start; at the end, not counting the first `skip` of either.
-    size_t commonPrefix(const void* data, int width, size_t n) const noexcept;
-    size_t commonSuffix(const void* data, int width, size_t n, size_t skip) const noexcept;
+    size_t commonPrefix(const void* data, int width, size_t n) noexcept;
+    size_t commonSuffix(const void* data, int width, size_t n, size_t skip) noexcept;
     size_t bytesHeld() const noexcept;
     // How many '\r' the text holds: without any, its lines split at
     // '\r\n', '\r' and '\n' are its rows.
     size_t carriageReturns() const noexcept { return carriageReturns_; }
 
 private:
-    using Chunk = std::vector<uint8_t>;
+    using Bytes = std::vector<uint8_t>;
+    // A chunk keeps `room` unused characters after its first `gap`: an edit
+    // moves the room to its place, and the next edit there (a keystroke
+    // after a keystroke, a place typed at again) moves nothing.
+    struct Chunk {
+        Bytes bytes;
+        size_t gap = 0;
+        size_t room = 0;
+    };
 
     uint32_t charAt(const uint8_t* p, size_t k) const noexcept { return charOf(p, width_, k); }
-    size_t chars(const Chunk& c) const noexcept { return c.size() / static_cast<size_t>(width_); }
+    size_t chars(const Chunk& c) const noexcept { return c.bytes.size() / static_cast<size_t>(width_) - c.room; }
+    // Where character k of the chunk is: at base(c, k) + k * width().
+    const uint8_t* base(const Chunk& c, size_t k) const noexcept {
+        return c.bytes.data() + (k < c.gap ? 0 : c.room * static_cast<size_t>(width_));
+    }
+    void moveGap(Chunk& c, size_t k) noexcept;
+    // Characters [start, end) where chunk c holds them one after the other,
+    // or null (they cross its room or its end).
+    const uint8_t* inPlace(size_t c, size_t start, size_t end) const noexcept;
+    void closeGap(Chunk& c) noexcept;
     // The chunk holding character `i`; the last one for i == size().
     size_t chunkOf(size_t i) const noexcept {
         if (i >= starts_[hint_] && i < starts_[hint_ + 1]) return hint_;
         return hint_ = find(i);
     }
     size_t find(size_t i) const noexcept;
-    // f(chunk data, from, to) for each chunk's part of characters [start, end).
+    // f(p, from, to) for each piece of characters [start, end) that lies
+    // in one place: characters [from, to) of a chunk, character k at
+    // p + k * width().
     template <class F>
     void eachPiece(size_t start, size_t end, F f) const {
         for (size_t c = chunkOf(start), i = start; i < end; ++c) {
-            f(chunks_[c].data(), i - starts_[c], std::min(end, starts_[c + 1]) - starts_[c]);
+            const Chunk& chunk = chunks_[c];
+            const size_t from = i - starts_[c];
+            const size_t to = std::min(end, starts_[c + 1]) - starts_[c];
+            if (from < chunk.gap) f(chunk.bytes.data(), from, std::min(to, chunk.gap));
+            if (to > chunk.gap) f(base(chunk, chunk.gap), std::max(from, chunk.gap), to);
             i = starts_[c + 1];
         }
     }
@@ -99,7 +123,7 @@ private:
     void copyChars(size_t start, size_t end, uint8_t* out) const noexcept;
     void widen(int width);
     // Chunks [first, last] become the characters of `joined`, cut in pieces.
-    void rechunk(size_t first, size_t last, const Chunk& joined);
+    void rechunk(size_t first, size_t last, const Bytes& joined);
     void restart(size_t from) noexcept;  // starts_ from chunk `from` on
     void mergeIfSmall(size_t c);
 
