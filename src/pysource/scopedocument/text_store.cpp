@@ -229,9 +229,11 @@ void TextStore::replace(size_t start, size_t end, const void* data, int width, s
             const size_t kept = chars(chunk);
             const size_t room = n + 16 + kept / 16;
             Bytes grown((kept + room) * w);
-            std::memcpy(grown.data(), chunk.bytes.data(), chunk.gap * w);
-            std::memcpy(grown.data() + (chunk.gap + room) * w, chunk.bytes.data() + (chunk.gap + chunk.room) * w,
-                        (kept - chunk.gap) * w);
+            if (chunk.gap > 0) std::memcpy(grown.data(), chunk.bytes.data(), chunk.gap * w);
+            if (kept > chunk.gap) {
+                std::memcpy(grown.data() + (chunk.gap + room) * w, chunk.bytes.data() + (chunk.gap + chunk.room) * w,
+                            (kept - chunk.gap) * w);
+            }
             chunk.bytes.swap(grown);
             chunk.room = room;
         }
