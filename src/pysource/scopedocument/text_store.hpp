@@ -5,9 +5,10 @@
 // An edit rewrites the chunks it touches and shifts the start of the
 // chunks after it, so an edit costs what it holds plus a pass over the
 // chunk starts, wherever it is and wherever the one before it was (a
-// single gap had to travel between them). The reader wants the characters
-// it scans one after the other: a range inside one chunk is read in place,
-// one that crosses chunks is copied out first.
+// single gap for the whole text had to travel between them). Each chunk
+// keeps its own spare room where it was last edited. The reader wants the
+// characters it scans one after the other: a range that one chunk holds on
+// one side of its room is read in place, any other is copied out first.
 //
 // Rows are the physical lines (split at '\n' only): row k (0-based) starts
 // after the k-th '\n'. The row table keeps, per row, where it starts and
