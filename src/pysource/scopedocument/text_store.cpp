@@ -226,15 +226,16 @@ void TextStore::replace(size_t start, size_t end, const void* data, int width, s
         chunk.room += k1 - k0;
         if (chunk.room < n) {
             // Room for this and the next few, a sixteenth of the chunk.
+            // The new bytes go at the end (only they are zeroed), then the
+            // characters after the room move up to them.
             const size_t kept = chars(chunk);
             const size_t room = n + 16 + kept / 16;
-            Bytes grown((kept + room) * w);
-            if (chunk.gap > 0) std::memcpy(grown.data(), chunk.bytes.data(), chunk.gap * w);
-            if (kept > chunk.gap) {
-                std::memcpy(grown.data() + (chunk.gap + room) * w, chunk.bytes.data() + (chunk.gap + chunk.room) * w,
-                            (kept - chunk.gap) * w);
-            }
-            chunk.bytes.swap(grown);
+            const size_t held = chunk.bytes.size();
+            const size_t tail = (kept - chunk.gap) * w;
+            chunk.bytes.reserve((kept + room) * w);
+            chunk.bytes.resize((kept + room) * w);
+            uint8_t* p = chunk.bytes.data();
+            if (tail > 0) std::memmove(p + (chunk.gap + room) * w, p + held - tail, tail);
             chunk.room = room;
         }
         put(chunk.bytes.data() + chunk.gap * w, width_, data, width, n);
