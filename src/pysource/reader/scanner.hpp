@@ -136,11 +136,19 @@ template <class Char>
 class Scanner {
 public:
     Scanner(const Char* text, size_t length) : text_(text), length_(length) { start(1, 0, LineState{}, nullptr, 0); }
-    // Scanning into `buffers`' vectors, to be handed back (giveBack).
-    Scanner(const Char* text, size_t length, ScanBuffers& buffers) : text_(text), length_(length) {
+    // Scanning into `buffers`' vectors, handed back when the scanner goes;
+    // one a read grew past kKeptItems items is freed rather than kept.
+    Scanner(const Char* text, size_t length, ScanBuffers& buffers)
+        : text_(text), length_(length), lender_(&buffers) {
         borrow(buffers);
         start(1, 0, LineState{}, nullptr, 0);
     }
+    ~Scanner() {
+        if (lender_ != nullptr) giveBack(*lender_);
+    }
+    Scanner(const Scanner&) = delete;
+    Scanner& operator=(const Scanner&) = delete;
+    static constexpr size_t kKeptItems = 4096;
 
     // Starts (again) at a row; indents null means the stack {0}. Output
     // vectors are cleared.
@@ -171,15 +179,6 @@ public:
     int64_t rowIndentColumn() const { return rowIndentColumn_; }
     const std::vector<int64_t>& indents() const { return indents_; }
 
-    // Hands the borrowed vectors back; one grown past `keep` elements is
-    // freed rather than kept.
-    void giveBack(ScanBuffers& b, size_t keep) noexcept {
-        borrow(b);
-        trim(b.indents, keep);
-        trim(b.tokens, keep);
-        trim(b.records, keep);
-    }
-
     const PodVector<TokenSpan>& tokens() const { return tokens_; }
     const std::vector<Record>& records() const { return records_; }
     const ScanError& error() const { return error_; }
@@ -194,6 +193,12 @@ private:
         indents_.swap(b.indents);
         tokens_.swap(b.tokens);
         records_.swap(b.records);
+    }
+    void giveBack(ScanBuffers& b) noexcept {
+        borrow(b);
+        trim(b.indents, kKeptItems);
+        trim(b.tokens, kKeptItems);
+        trim(b.records, kKeptItems);
     }
     template <class T>
     static void trim(std::vector<T>& v, size_t keep) noexcept {
@@ -245,6 +250,7 @@ private:
     PodVector<TokenSpan> tokens_;  // a long read's many: grown in place
     std::vector<Record> records_;
     ScanError error_;
+    ScanBuffers* lender_ = nullptr;  // whose vectors these are, when borrowed
 };
 
 // The width of row[0, column) as an indentation: tabs to the next multiple

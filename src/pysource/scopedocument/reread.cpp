@@ -363,18 +363,6 @@ py::Ref readWholeAs(Document& d, const void* source) {
     return makeLogicals(scanner, p, d);
 }
 
-// The scanner of one group's read scans into the document's buffers, and
-// hands them back when it goes: what an edit reads is small, so the buffers
-// are kept unless a read made them large.
-template <class Char>
-struct BuffersLent {
-    Scanner<Char>& scanner;
-    reader::ScanBuffers& buffers;
-    ~BuffersLent() { scanner.giveBack(buffers, 4096); }
-};
-template <class Char>
-BuffersLent(Scanner<Char>&, reader::ScanBuffers&) -> BuffersLent<Char>;
-
 // The rows read again for one or more damage ranges (a read that runs into
 // the next range takes it in), and what they read into.
 struct GroupRead {
@@ -458,8 +446,9 @@ void rereadAs(Document& d, EditOutcome& out) {
         auto windowEnd = [&] { return G.first + windowRows >= count ? n : d.rows.start(G.first + windowRows, n); };
         size_t end = windowEnd();
         const Char* p = static_cast<const Char*>(d.text.contiguous(base, end));
+        // Into the document's buffers: what an edit reads is small, so they
+        // are kept for the next one unless a read made them large.
         Scanner<Char> scanner(p, end - base, d.scratch.scan);
-        BuffersLent lent{scanner, d.scratch.scan};
         scanner.start(static_cast<int64_t>(G.first) + 1, 0, unpack(d.rows.state(G.first)), G.stack.data(),
                       G.stack.size());
         takeIn(j);
