@@ -14,9 +14,7 @@ from progress import Progress
 from dockit.checks import Session
 from dockit.makers import TextEditMaker
 from dockit.repro import DocumentClass, WriteReproducer, kDefaultReproDir
-from replaykit.cli import ByKind, SampleFiles, SeededRandom, StdlibFiles, _Short
-
-kSamplePath = os.path.join(toolpath.kRepoDir, 'samples', 'outline_sample.py')
+from replaykit.cli import ByKind, ChoosePaths, SampleFiles, SeededRandom, StdlibFiles, _Short  # noqa: F401 (offered here too)
 
 
 def RunReplay(paths, document='native', seed=0, edits_per_file=150, reset_every=50,
@@ -201,13 +199,7 @@ def _ParseArgs(argv):
 
 def main(argv=None):
     args = _ParseArgs(sys.argv[1:] if argv is None else argv)
-    paths = list(args.paths) + list(args.files)
-    if args.stdlib:
-        paths.extend(StdlibFiles())
-    if not paths:
-        paths = [kSamplePath]
-    if args.sample is not None:
-        paths = SampleFiles(paths, args.sample, args.seed)
+    paths = ChoosePaths(list(args.paths) + list(args.files), args.stdlib, args.sample, args.seed)
     document = 'reference' if args.reference else 'native'
     try:
         DocumentClass(document)

@@ -222,6 +222,20 @@ def Failed(summary):
                 summary['errors'] or summary['replay_errors'])
 
 
+def ChoosePaths(paths, stdlib, sample, seed):
+    """The files a replay edits: those given, the standard library's too with
+    `stdlib`, the bundled sample when there are none; with `sample`, that
+    many of them picked by `seed`."""
+    paths = list(paths)
+    if stdlib:
+        paths.extend(StdlibFiles())
+    if not paths:
+        paths = [kSamplePath]
+    if sample is not None:
+        paths = SampleFiles(paths, sample, seed)
+    return paths
+
+
 def _ParseArgs(argv):
     parser = argparse.ArgumentParser(
         prog='replay.py', description='Replays seeded edits through CChangeFinder and checks '
@@ -259,13 +273,7 @@ def _ParseArgs(argv):
 
 def main(argv=None):
     args = _ParseArgs(sys.argv[1:] if argv is None else argv)
-    paths = list(args.files)
-    if args.stdlib:
-        paths.extend(StdlibFiles())
-    if not paths:
-        paths = [kSamplePath]
-    if args.sample is not None:
-        paths = SampleFiles(paths, args.sample, args.seed)
+    paths = ChoosePaths(args.files, args.stdlib, args.sample, args.seed)
     summary = RunReplay(paths, seed=args.seed, edits_per_file=args.edits,
                         batch_fraction=args.batch_fraction, cache_check=args.cache_check,
                         reset_every=args.reset_every, stop_on_failure=args.stop_on_failure,
