@@ -106,22 +106,17 @@ def StdlibPath(name):
 def Concatenated(lines_wanted):
     """Top-level standard library modules, each readable alone, joined until
     they hold `lines_wanted` lines."""
-    parts, count = [], 0
-    for name in sorted(os.listdir(toolpath.StdlibDir())):
-        if not name.endswith('.py'):
-            continue
-        try:
-            text = toolpath.ReadSource(StdlibPath(name))
-            ReadLogicals(text)
-        except (SyntaxError, ValueError, IOError):
-            continue
-        if not text.endswith('\n'):
-            text += '\n'
-        parts.append(text)
-        count += text.count('\n')
-        if count >= lines_wanted:
-            break
-    return ''.join(parts)
+    def Readable():
+        for name in sorted(os.listdir(toolpath.StdlibDir())):
+            if not name.endswith('.py'):
+                continue
+            try:
+                text = toolpath.ReadSource(StdlibPath(name))
+                ReadLogicals(text)
+            except (SyntaxError, ValueError, IOError):
+                continue
+            yield text
+    return benchkit.JoinLines(Readable(), lines_wanted)
 
 
 def Files(sizes):

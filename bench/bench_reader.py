@@ -108,15 +108,7 @@ def Outline(name, text, rounds, reference_rounds):
 
 def Joined(texts, lines):
     """The texts joined (each ending in a newline) up to about `lines` lines."""
-    parts, total = [], 0
-    for _, text in texts:
-        if not text.endswith('\n'):
-            text += '\n'
-        parts.append(text)
-        total += text.count('\n')
-        if total >= lines:
-            break
-    joined = ''.join(parts)
+    joined = benchkit.JoinLines((text for _, text in texts), lines)
     _reader.Scan(joined)
     return joined
 

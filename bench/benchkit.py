@@ -95,6 +95,20 @@ def Synthesise(logicals):
     return ''.join(_kUnit % {'k': k} for k in range(units))
 
 
+def JoinLines(texts, lines):
+    """The texts joined, each ending in a newline, until they hold `lines`
+    lines (an iterable is read no further than that)."""
+    parts, total = [], 0
+    for text in texts:
+        if not text.endswith('\n'):
+            text += '\n'
+        parts.append(text)
+        total += text.count('\n')
+        if total >= lines:
+            break
+    return ''.join(parts)
+
+
 def NamedList(logicals):
     """A synthesised file read into logicals (line numbers spread out by
     kLineStep) and named by a whole-list pass, with its finder."""
