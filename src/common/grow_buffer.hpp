@@ -97,8 +97,6 @@ public:
     const T& operator[](size_t k) const noexcept { return data()[k]; }
     const T& front() const noexcept { return data()[0]; }
     const T& back() const noexcept { return data()[size_ - 1]; }
-    const T* begin() const noexcept { return data(); }
-    const T* end() const noexcept { return data() + size_; }
 
     void push_back(const T& value) {
         if (size_ == capacity()) bytes_.reserve(sizeof(T) * (size_ < 32 ? 64 : size_ * 2));
